@@ -1,0 +1,54 @@
+#include "common/lock_file.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+
+#include "common/log.h"
+#include "sdk/platform.h"
+
+namespace vellis {
+namespace {
+
+// Opens the lock file without following a link and without blocking on a
+// FIFO; anything but a regular file fails with errno set.
+int OpenLockFile(const std::string& path) {
+  int fd = open(path.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0644);
+  if (fd < 0) return -1;
+  struct stat st;
+  if (fstat(fd, &st) != 0 || !S_ISREG(st.st_mode)) {
+    close(fd);
+    errno = EINVAL;
+    return -1;
+  }
+  return fd;
+}
+
+}  // namespace
+
+LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(path) {
+  int budget = kMaxAttempts;
+  for (;;) {
+    VELLIS_THROW_IF(0 > (fd_ = OpenLockFile(path_)), kErrLock,
+                    "open failed, path=" + path_ + ", reason=" + strerror(errno));
+    if (flock(fd_, (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB) == 0) return;
+    int err = errno;
+    close(fd_);  // a half-made lock object must not leak its descriptor
+    fd_ = -1;
+    if (err != EINTR && err != EWOULDBLOCK) throw Error(kErrLock, strerror(err));
+    sdk::GetPlatform()->USleep(static_cast<uint64_t>(sdk::GetPlatform()->Rand() % 10) * 100000);
+    if (--budget == 0) throw Error(kErrLock, "Exceed max retry, path=" + path_);
+  }
+}
+
+LockFile::~LockFile() {
+  if (fd_ < 0) return;
+  flock(fd_, LOCK_UN);
+  close(fd_);
+}
+
+}  // namespace vellis

@@ -1,0 +1,185 @@
+// Queue events folded into a tree of pending operations.
+//
+// A queue file holds one JSON event per line. OPTree reads one whole queue
+// file, folds each event into per-path operations by the merge rules, and
+// hands the surviving operations to a caller in the order in which they were
+// first attached.
+//
+// Trees, nodes and operations are held by shared pointers. A tree frees all
+// its nodes when it is destroyed: it breaks the parent/child and node/op links
+// first, so an OP kept after its tree is gone keeps its own node but no
+// longer its parents. Nothing here is thread-safe; a tree belongs to one
+// thread for one round.
+#pragma once
+
+#include <json/json.h>
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <ostream>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace vellis::fileindex {
+
+// Bits of a queue line's "event".
+enum EventBit : uint32_t {
+  kEventModify = 0x2,
+  kEventAttr = 0x4,
+  kEventCreate = 0x40,
+  kEventDelete = 0x80,
+  kEventRename = 0x100,
+  kEventCrash = 0x200,
+  kEventReindex = 0x10000,
+  kEventUpdateCfg = 0x20000,
+};
+
+// One queue line.
+struct Event {
+  // Parses one line (without its newline). Throws Error 906 "Malformed
+  // event_raw: <line>" (logged first) when the text is not JSON, and the
+  // JSON helpers' Error 120 when "event" or "path" is missing or a key has
+  // the wrong type. "is_dir" defaults to false, "path_old" to empty, "data"
+  // to null.
+  explicit Event(const std::string& event_raw);
+
+  uint32_t event = 0;
+  bool is_dir = false;
+  std::string path;
+  std::string path_old;
+  Json::Value data;
+};
+
+enum FileIndexOP {
+  FILE_INDEX_OP_NONE = 0,
+  FILE_INDEX_OP_DELETE = 1,
+  FILE_INDEX_OP_UPSERT = 2,
+  FILE_INDEX_OP_ATTR = 3,
+  FILE_INDEX_OP_UPDATE_CFG = 4,
+  FILE_INDEX_OP_RENAME = 5,
+  FILE_INDEX_OP_REINDEX = 6,
+  FILE_INDEX_OP_CRASH = 7,
+};
+
+struct OPNode;
+
+// One pending operation on a node.
+struct OP {
+  OP(std::shared_ptr<OPNode> node, FileIndexOP op, const std::string& path_old,
+     const Json::Value& data);
+
+  // Merges another configuration update's category flags into data: for
+  // each of "document", "audio", "video", "photo", data[key] becomes the
+  // boolean (other's flag, default false) OR (data[key] is true). Other keys
+  // are left as they are.
+  void MergeData(const Json::Value& other);
+
+  std::shared_ptr<OPNode> node;
+  FileIndexOP op;
+  std::string path_old;
+  Json::Value data;
+};
+
+// One path component and the operations pending on it.
+struct OPNode : public std::enable_shared_from_this<OPNode> {
+  OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
+
+  // The full path: the names from the root down joined with "/" ("/a/b";
+  // the root's own path is empty).
+  std::string GetPath() const;
+
+  // The child of that name, created and appended to `children` when
+  // missing. Children keep their creation order; the lookup is not a linear
+  // scan for wide folders.
+  std::shared_ptr<OPNode> GetChild(const std::string& name);
+
+  // Calls fn for each operation in `ops`, in order, cancelled ones included.
+  void TraverseOP(const std::function<void(std::shared_ptr<OP>)>& fn);
+
+  std::string name;
+  std::shared_ptr<OPNode> parent;
+  std::vector<std::shared_ptr<OPNode>> children;
+  std::vector<std::shared_ptr<OP>> ops;
+};
+
+class OPTree {
+ public:
+  // Paths longer than this cannot name a file and are refused (9999).
+  static constexpr size_t kMaxPathBytes = 4095;
+
+  // Makes the tree (not crashed, empty root) and reads `queue_path` at once
+  // (BuildTree); throws what BuildTree throws.
+  explicit OPTree(const std::string& queue_path);
+  ~OPTree();
+  OPTree(const OPTree&) = delete;
+  OPTree& operator=(const OPTree&) = delete;
+
+  // Reads the queue file line by line and inserts each event. A line that
+  // cannot be parsed or inserted (not JSON, 1 MiB or longer, a bad path...)
+  // is logged and skipped; reading stops after a line with the crash bit.
+  // Throws Error 502 "Failed to open queue, reason=..." when the file cannot
+  // be opened (a symbolic link, FIFO or directory included).
+  void BuildTree();
+
+  // Folds one event into the tree by the merge rules.
+  void InsertEvent(std::shared_ptr<Event> event);
+
+  // The node of a full path, creating missing nodes. Throws Error 9999
+  // "GetNodeByPath failed, path=<path>" for a path that is empty, relative,
+  // has a doubled or trailing "/", a "." or ".." component, or is longer
+  // than kMaxPathBytes.
+  std::shared_ptr<OPNode> GetNodeByPath(const std::string& path);
+
+  // Depth first, post-order over `node`'s subtree, children in creation
+  // order, each list copied before it is walked; `node` itself is visited
+  // last unless `skip_self`.
+  void TraverseNodeDescendant(std::shared_ptr<OPNode> node,
+                              const std::function<void(std::shared_ptr<OPNode>)>& fn,
+                              bool skip_self);
+
+  // Delivers the surviving operations in order of first attachment and
+  // returns the number of attached operations, cancelled ones included. A
+  // crashed tree delivers one FILE_INDEX_OP_CRASH on the root and returns 1.
+  // Exceptions from fn propagate; later operations are then not delivered.
+  unsigned int ProcessOP(const std::function<void(std::shared_ptr<OP>)>& fn);
+
+  bool crashed = false;
+  std::string queue_path;
+  std::shared_ptr<OPNode> root;
+  std::vector<std::shared_ptr<OP>> ops;
+
+ private:
+  void Attach(const std::shared_ptr<OP>& op);
+  void HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
+  void HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
+  void HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
+  void HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
+  void HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
+  void HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
+  void HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
+  // Moves pending upsert/attr/reindex work of `from` onto `to`.
+  void CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to);
+
+  // Open-addressing index of every node below the root by (parent, name),
+  // so that a child is found in constant time however wide its folder is.
+  class ChildIndex {
+   public:
+    OPNode* Find(const OPNode* parent, std::string_view name) const;
+    void Insert(OPNode* child);
+
+   private:
+    static size_t Hash(const OPNode* parent, std::string_view name);
+    std::vector<OPNode*> slots_;
+    size_t used_ = 0;
+  };
+  ChildIndex index_;
+};
+
+// "[05] /old -> /new", "[04] /a, data={...}", "[02] /a".
+std::ostream& operator<<(std::ostream& os, const std::shared_ptr<OP>& op);
+// "Node[/a]: " followed by its operations separated by ", ".
+std::ostream& operator<<(std::ostream& os, const std::shared_ptr<OPNode>& node);
+
+}  // namespace vellis::fileindex

@@ -1,0 +1,20 @@
+// Command groups of the `vellis` command line.
+//
+// Each Add*Commands registers its subcommands on the app. A subcommand's
+// CLI11 callback only stores its action in Context::action; main() runs the
+// action after parsing, in its one try/catch that turns vellis::Error into
+// "error <code>: <reason>" on stderr and exit status 1.
+#pragma once
+
+#include <CLI/CLI.hpp>
+#include <functional>
+
+namespace vellis::cli {
+
+struct Context {
+  std::function<void()> action;
+};
+
+void AddQueueCommands(CLI::App& app, Context& ctx);
+
+}  // namespace vellis::cli

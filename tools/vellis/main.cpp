@@ -1,0 +1,35 @@
+// vellis: the command line of the file-indexing service.
+#include <syslog.h>
+
+#include <iostream>
+
+#include "common/error.h"
+#include "tools/vellis/commands.h"
+
+int main(int argc, char** argv) {
+  CLI::App app{"vellis: manage and inspect the file-indexing service"};
+  app.require_subcommand(1);
+  bool verbose = false;
+  app.add_flag("-v,--verbose", verbose, "Copy the system-log lines of this run to stderr");
+
+  vellis::cli::Context ctx;
+  vellis::cli::AddQueueCommands(app, ctx);
+
+  try {
+    app.parse(argc, argv);
+  } catch (const CLI::ParseError& e) {
+    return app.exit(e);
+  }
+
+  openlog("vellis", LOG_PID | (verbose ? LOG_PERROR : 0), LOG_USER);
+  try {
+    if (ctx.action) ctx.action();
+  } catch (const vellis::Error& e) {
+    std::cerr << "error " << static_cast<int>(e.GetCode()) << ": " << e.what() << "\n";
+    return 1;
+  } catch (const std::exception& e) {
+    std::cerr << "error: " << e.what() << "\n";
+    return 1;
+  }
+  return 0;
+}
