@@ -67,6 +67,9 @@ OP::OP(std::shared_ptr<OPNode> node, FileIndexOP op, const std::string& path_old
 void OP::MergeData(const Json::Value& other_in) {
   const Json::Value other = other_in;  // `other_in` may be this->data itself
   for (const char* key : kCategoryKeys) {
+    // The incoming flag is read as the JSON helper reads a boolean, so a
+    // number counts as the JSON library converts it (1 is true); the
+    // pending flag counts only when it is a real true.
     bool other_flag = false;
     if (other.isObject()) GetJsonValue(other_flag, other, key, false);
     bool current = data.isObject() && data[key].isBool() && data[key].asBool();
@@ -104,59 +107,108 @@ void OPNode::TraverseOP(const std::function<void(std::shared_ptr<OP>)>& fn) {
   for (size_t i = 0, n = ops.size(); i < n; ++i) fn(ops[i]);
 }
 
-size_t OPTree::ChildIndex::Hash(const OPNode* parent, std::string_view name) {
-  size_t h = std::hash<std::string_view>()(name);
-  return h ^ (reinterpret_cast<uintptr_t>(parent) * 0x9E3779B97F4A7C15ull);
-}
+namespace {
 
-OPNode* OPTree::ChildIndex::Find(const OPNode* parent, std::string_view name) const {
-  if (slots_.empty()) return nullptr;
-  size_t mask = slots_.size() - 1;
-  for (size_t i = Hash(parent, name) & mask;; i = (i + 1) & mask) {
-    OPNode* n = slots_[i];
-    if (n == nullptr) return nullptr;
-    if (n->parent.get() == parent && n->name == name) return n;
+// Slots tag the unused top 16 bits of a user-space pointer.
+static_assert(sizeof(uintptr_t) == 8, "the path index tags 64-bit pointers");
+constexpr int kTagShift = 48;
+constexpr uintptr_t kPointerMask = (uintptr_t{1} << kTagShift) - 1;
+
+// Whether the node's full path is `path`, compared component by component
+// up the parent chain.
+bool PathEquals(const OPNode* n, std::string_view path) {
+  size_t end = path.size();
+  for (; n->parent; n = n->parent.get()) {
+    const size_t len = n->name.size();
+    if (end < len + 1 || path[end - len - 1] != '/' ||
+        memcmp(path.data() + end - len, n->name.data(), len) != 0) {
+      return false;
+    }
+    end -= len + 1;
   }
+  return end == 0;
 }
 
-void OPTree::ChildIndex::Insert(OPNode* child) {
-  if ((used_ + 1) * 2 > slots_.size()) {
-    std::vector<OPNode*> old;
-    old.swap(slots_);
-    slots_.assign(old.empty() ? 64 : old.size() * 2, nullptr);
-    used_ = 0;
-    for (OPNode* n : old) {
-      if (n) Insert(n);
+}  // namespace
+
+uint32_t OPTree::PathIndex::Hash(std::string_view path) {
+  uint64_t h = std::hash<std::string_view>()(path);
+  h ^= h >> 33;
+  h *= 0xff51afd7ed558ccdULL;
+  h ^= h >> 33;
+  return static_cast<uint32_t>(h);
+}
+
+// The slot tag: 16 bits of the hash, mixed apart from the low bits that pick
+// the slot.
+uintptr_t OPTree::PathIndex::Tag(uint32_t hash) {
+  return static_cast<uintptr_t>((hash * 0x9E3779B1u) >> 16) << kTagShift;
+}
+
+OPNode* OPTree::PathIndex::Find(std::string_view path, uint32_t hash) const {
+  if (slots_.empty()) return nullptr;
+  const size_t mask = slots_.size() - 1;
+  const uintptr_t tag = Tag(hash);
+  for (size_t i = hash & mask;; i = (i + 1) & mask) {
+    const uintptr_t slot = slots_[i];
+    if (slot == 0) return nullptr;
+    if ((slot & ~kPointerMask) == tag) {
+      OPNode* n = reinterpret_cast<OPNode*>(slot & kPointerMask);
+      if (PathEquals(n, path)) return n;
     }
   }
-  size_t mask = slots_.size() - 1;
-  size_t i = Hash(child->parent.get(), child->name) & mask;
-  while (slots_[i] != nullptr) i = (i + 1) & mask;
-  slots_[i] = child;
+}
+
+void OPTree::PathIndex::Insert(OPNode* node, uint32_t hash) {
+  // Linear probing stays short below three quarters full, and the tags
+  // spare most probes a visit to the node.
+  if ((used_ + 1) * 4 > slots_.size() * 3) {
+    std::vector<uintptr_t> old;
+    old.swap(slots_);
+    slots_.assign(old.empty() ? 1024 : old.size() * 2, 0);
+    used_ = 0;
+    for (uintptr_t slot : old) {
+      if (slot != 0) {
+        OPNode* n = reinterpret_cast<OPNode*>(slot & kPointerMask);
+        Insert(n, n->path_hash_);
+      }
+    }
+  }
+  node->path_hash_ = hash;
+  const size_t mask = slots_.size() - 1;
+  size_t i = hash & mask;
+  while (slots_[i] != 0) i = (i + 1) & mask;
+  slots_[i] = Tag(hash) | (reinterpret_cast<uintptr_t>(node) & kPointerMask);
   ++used_;
 }
 
 OPTree::OPTree(const std::string& path)
     : queue_path(path), root(std::make_shared<OPNode>(nullptr, std::string())) {
-  BuildTree();
+  try {
+    BuildTree();
+  } catch (...) {
+    Clear();  // no destructor runs for a tree whose constructor throws
+    throw;
+  }
 }
 
-OPTree::~OPTree() {
-  // Break every link first, then release the nodes deepest-first, so that no
-  // destructor recurses down (or up) a long chain.
-  std::vector<std::shared_ptr<OPNode>> preorder;
-  std::vector<std::shared_ptr<OPNode>> stack{root};
-  while (!stack.empty()) {
-    std::shared_ptr<OPNode> n = std::move(stack.back());
-    stack.pop_back();
-    for (auto it = n->children.rbegin(); it != n->children.rend(); ++it) stack.push_back(*it);
+OPTree::~OPTree() { Clear(); }
+
+void OPTree::Clear() {
+  // Break every downward link first, collecting the nodes breadth first
+  // (ancestors before descendants), then release them from the back, so
+  // that no destructor recurses down or up a long chain. Parent links stay:
+  // an operation kept by a caller still knows its path.
+  std::vector<std::shared_ptr<OPNode>> nodes;
+  if (root) nodes.push_back(std::move(root));
+  for (size_t i = 0; i < nodes.size(); ++i) {
+    OPNode* n = nodes[i].get();
+    for (auto& child : n->children) nodes.push_back(std::move(child));
     n->children.clear();
     n->ops.clear();
-    preorder.push_back(std::move(n));
   }
   ops.clear();
-  root.reset();
-  while (!preorder.empty()) preorder.pop_back();
+  while (!nodes.empty()) nodes.pop_back();
 }
 
 void OPTree::BuildTree() {
@@ -188,24 +240,52 @@ void OPTree::BuildTree() {
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
   VELLIS_THROW_IF(!IsCanonicalPath(path), kErrNodeByPath, "GetNodeByPath failed, path=" + path);
+  const uint32_t hash = PathIndex::Hash(path);
+  if (OPNode* n = index_.Find(path, hash)) return n->shared_from_this();
+  // Find the deepest ancestor that exists, then create the rest below it.
   OPNode* node = root.get();
-  std::shared_ptr<OPNode> found = root;
   size_t start = 1;
+  for (size_t cut = path.rfind('/'); cut > 0; cut = path.rfind('/', cut - 1)) {
+    std::string_view prefix(path.data(), cut);
+    if (OPNode* n = index_.Find(prefix, PathIndex::Hash(prefix))) {
+      node = n;
+      start = cut + 1;
+      break;
+    }
+  }
+  bool found_unindexed = false;
   while (start <= path.size()) {
     size_t end = path.find('/', start);
     if (end == std::string::npos) end = path.size();
-    std::string_view name(path.data() + start, end - start);
-    OPNode* child = index_.Find(node, name);
+    const std::string_view prefix(path.data(), end);
+    const uint32_t prefix_hash = end == path.size() ? hash : PathIndex::Hash(prefix);
+    // A child made with OPNode::GetChild is not in the index yet; it must be
+    // found, not made a second time. Once such children were indexed, the
+    // rest of the path may exist below them.
+    if (IndexNewChildren(node)) found_unindexed = true;
+    OPNode* child = found_unindexed ? index_.Find(prefix, prefix_hash) : nullptr;
     if (child == nullptr) {
-      node->children.push_back(
-          std::make_shared<OPNode>(node->shared_from_this(), std::string(name)));
+      node->children.push_back(std::make_shared<OPNode>(
+          node->shared_from_this(), std::string(path.data() + start, end - start)));
       child = node->children.back().get();
-      index_.Insert(child);
+      index_.Insert(child, prefix_hash);
+      node->indexed_children_ = node->children.size();
     }
     node = child;
     start = end + 1;
   }
   return node->shared_from_this();
+}
+
+bool OPTree::IndexNewChildren(OPNode* node) {
+  bool added = false;
+  for (; node->indexed_children_ < node->children.size(); ++node->indexed_children_) {
+    OPNode* child = node->children[node->indexed_children_].get();
+    index_.Insert(child, PathIndex::Hash(child->GetPath()));
+    IndexNewChildren(child);
+    added = true;
+  }
+  return added;
 }
 
 void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,
@@ -405,10 +485,10 @@ void OPTree::CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_pt
 }
 
 void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
-  op->op = FILE_INDEX_OP_RENAME;
   // Resolve the old path first: a bad one refuses the line before anything
-  // changes.
+  // changes, also the kind of `op` when an earlier bit of the line attached it.
   std::shared_ptr<OPNode> old_node = GetNodeByPath(op->path_old);
+  op->op = FILE_INDEX_OP_RENAME;
   // Whatever was pending at the destination is superseded by the moved item.
   node->TraverseOP([&](std::shared_ptr<OP> e) {
     if (e->op == FILE_INDEX_OP_DELETE || e->op == FILE_INDEX_OP_UPSERT ||

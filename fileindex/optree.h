@@ -6,10 +6,10 @@
 // first attached.
 //
 // Trees, nodes and operations are held by shared pointers. A tree frees all
-// its nodes when it is destroyed: it breaks the parent/child and node/op links
-// first, so an OP kept after its tree is gone keeps its own node but no
-// longer its parents. Nothing here is thread-safe; a tree belongs to one
-// thread for one round.
+// its nodes when it is destroyed: it breaks the child and node-to-op links
+// first; parent links stay, so an OP kept after its tree is gone still knows
+// its node's path. Nothing here is thread-safe; a tree belongs to one thread
+// for one round.
 #pragma once
 
 #include <json/json.h>
@@ -91,8 +91,9 @@ struct OPNode : public std::enable_shared_from_this<OPNode> {
   std::string GetPath() const;
 
   // The child of that name, created and appended to `children` when
-  // missing. Children keep their creation order; the lookup is not a linear
-  // scan for wide folders.
+  // missing; children keep their creation order. A linear scan: the tree's
+  // own lookups go through OPTree::GetNodeByPath and its index, which also
+  // finds children made here.
   std::shared_ptr<OPNode> GetChild(const std::string& name);
 
   // Calls fn for each operation in `ops`, in order, cancelled ones included.
@@ -102,6 +103,13 @@ struct OPNode : public std::enable_shared_from_this<OPNode> {
   std::shared_ptr<OPNode> parent;
   std::vector<std::shared_ptr<OPNode>> children;
   std::vector<std::shared_ptr<OP>> ops;
+
+ private:
+  friend class OPTree;
+  // Kept by the tree's index; two 32-bit fields keep a node in the same
+  // allocation size class.
+  uint32_t path_hash_ = 0;         // hash of GetPath()
+  uint32_t indexed_children_ = 0;  // leading entries of `children` in the index
 };
 
 class OPTree {
@@ -151,6 +159,11 @@ class OPTree {
   std::vector<std::shared_ptr<OP>> ops;
 
  private:
+  // Unlinks and frees every node and operation of the tree.
+  void Clear();
+  // Puts children appended with OPNode::GetChild (and all below them) into
+  // the index; true when there were any.
+  bool IndexNewChildren(OPNode* node);
   void Attach(const std::shared_ptr<OP>& op);
   void HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
   void HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
@@ -162,19 +175,22 @@ class OPTree {
   // Moves pending upsert/attr/reindex work of `from` onto `to`.
   void CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to);
 
-  // Open-addressing index of every node below the root by (parent, name),
-  // so that a child is found in constant time however wide its folder is.
-  class ChildIndex {
+  // Open-addressing index of every node below the root by its full path, so
+  // that most events cost one probe however deep or wide the tree is. A slot
+  // holds a node pointer tagged in its top 16 bits with bits of the path's
+  // hash, so a probe rarely touches a node that does not match.
+  class PathIndex {
    public:
-    OPNode* Find(const OPNode* parent, std::string_view name) const;
-    void Insert(OPNode* child);
+    static uint32_t Hash(std::string_view path);
+    OPNode* Find(std::string_view path, uint32_t hash) const;
+    void Insert(OPNode* node, uint32_t hash);
 
    private:
-    static size_t Hash(const OPNode* parent, std::string_view name);
-    std::vector<OPNode*> slots_;
+    static uintptr_t Tag(uint32_t hash);
+    std::vector<uintptr_t> slots_;
     size_t used_ = 0;
   };
-  ChildIndex index_;
+  PathIndex index_;
 };
 
 // "[05] /old -> /new", "[04] /a, data={...}", "[02] /a".

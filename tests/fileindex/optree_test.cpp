@@ -1,0 +1,353 @@
+#include "fileindex/optree.h"
+
+#include <gtest/gtest.h>
+
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "common/error.h"
+#include "common/json_util.h"
+#include "tests/support/fake_platform.h"
+#include "tests/support/temp_root.h"
+
+namespace vellis::fileindex {
+namespace {
+
+std::string Print(const std::shared_ptr<OP>& op) {
+  std::ostringstream os;
+  os << op;
+  return os.str();
+}
+
+std::string Join(const std::vector<std::string>& v) {
+  std::string s;
+  for (const auto& x : v) s += "\n    " + x;
+  return s;
+}
+
+Json::Value ParseJson(const std::string& text) {
+  Json::Value v;
+  EXPECT_TRUE(JsonFromString(v, text)) << text;
+  return v;
+}
+
+class OPTreeTest : public ::testing::Test {
+ protected:
+  struct Folded {
+    std::vector<std::string> delivered;  // printed forms, in delivery order
+    unsigned count = 0;
+  };
+
+  std::string WriteQueue(const std::vector<std::string>& lines) {
+    std::string text;
+    for (const auto& l : lines) text += l + "\n";
+    testing::WriteFile(queue_, text);
+    return queue_;
+  }
+
+  Folded Fold(const std::vector<std::string>& lines) {
+    OPTree tree(WriteQueue(lines));
+    Folded f;
+    f.count = tree.ProcessOP([&](std::shared_ptr<OP> op) { f.delivered.push_back(Print(op)); });
+    return f;
+  }
+
+  testing::TempRoot root_;
+  testing::FakePlatform platform_;
+  testing::ScopedPlatform scoped_{&platform_};
+  std::string queue_ = root_.Path("/queue");
+};
+
+TEST_F(OPTreeTest, FoldsLinesOfOnePathByTheMergeRules) {
+  const std::string create = R"({"event":64,"path":"/s/a"})";
+  const std::string modify = R"({"event":2,"path":"/s/a"})";
+  const std::string attr = R"({"event":4,"path":"/s/a"})";
+  const std::string del = R"({"event":128,"path":"/s/a"})";
+  const std::string reindex = R"({"event":65536,"path":"/s/a"})";
+  const std::string cfg_doc = R"({"event":131072,"path":"/s/a","data":{"document":true}})";
+  const std::string cfg_photo = R"({"event":131072,"path":"/s/a","data":{"photo":true}})";
+  struct Case {
+    const char* what;
+    std::vector<std::string> lines;
+    std::vector<std::string> delivered;
+    unsigned count;
+  } cases[] = {
+      {"create then delete: the delete rewrites the upsert", {create, del}, {"[01] /s/a"}, 1},
+      {"delete then create: a create revives the path", {del, create}, {"[02] /s/a"}, 1},
+      {"delete then modify: the delete stands", {del, modify}, {"[01] /s/a"}, 1},
+      {"modify three times", {modify, modify, modify}, {"[02] /s/a"}, 1},
+      {"attr then modify: the attr becomes an upsert", {attr, modify}, {"[02] /s/a"}, 1},
+      {"modify then attr", {modify, attr}, {"[02] /s/a"}, 1},
+      {"two configuration updates merge",
+       {cfg_doc, cfg_photo},
+       {R"([04] /s/a, data={"audio":false,"document":true,"photo":true,"video":false})"},
+       1},
+      {"modify then update cfg: the upsert takes the data",
+       {modify, cfg_doc},
+       {R"([04] /s/a, data={"document":true})"},
+       1},
+      {"update cfg then delete: both stand", {cfg_doc, del},
+       {R"([04] /s/a, data={"document":true})", "[01] /s/a"}, 2},
+      {"reindex then delete: both stand", {reindex, del}, {"[06] /s/a", "[01] /s/a"}, 2},
+      {"modify then reindex", {modify, reindex}, {"[06] /s/a"}, 1},
+      {"delete then update cfg: dropped", {del, cfg_doc}, {"[01] /s/a"}, 1},
+      {"create and modify on one line yield nothing",
+       {R"({"event":66,"path":"/s/a","is_dir":false})"}, {}, 1},
+      {"attr and modify on one line yield nothing", {R"({"event":6,"path":"/s/a"})"}, {}, 1},
+      {"a deleted directory is reindexed", {R"({"event":128,"path":"/s/d","is_dir":true})"},
+       {"[06] /s/d"}, 1},
+      {"a created directory is reindexed", {R"({"event":64,"path":"/s/d","is_dir":true})"},
+       {"[06] /s/d"}, 1},
+      {"rename then modify of the new path",
+       {R"({"event":256,"path":"/s/b","path_old":"/s/a"})", R"({"event":2,"path":"/s/b"})"},
+       {"[05] /s/a -> /s/b", "[02] /s/b"}, 2},
+      {"no bit, or only unknown bits: no operation",
+       {R"({"event":0,"path":"/s/a"})", R"({"event":9,"path":"/s/a"})"}, {}, 0},
+  };
+  for (const auto& c : cases) {
+    Folded f = Fold(c.lines);
+    EXPECT_EQ(f.delivered, c.delivered) << c.what << ", got:" << Join(f.delivered);
+    EXPECT_EQ(f.count, c.count) << c.what;
+  }
+}
+
+TEST_F(OPTreeTest, CreatedDirectoryCancelsPendingWorkBelowButNotRenames) {
+  Folded f = Fold({
+      R"({"event":2,"path":"/s/d/a"})",
+      R"({"event":256,"path":"/s/d/y","path_old":"/s/x"})",
+      R"({"event":4,"path":"/s/d/e/f"})",
+      R"({"event":131072,"path":"/s/d/e","data":{"audio":true}})",
+      R"({"event":2,"path":"/s/other"})",
+      R"({"event":64,"path":"/s/d","is_dir":true})",
+  });
+  EXPECT_EQ(f.delivered, (std::vector<std::string>{"[05] /s/x -> /s/d/y", "[02] /s/other",
+                                                   "[06] /s/d"}))
+      << Join(f.delivered);
+  EXPECT_EQ(f.count, 6u);
+}
+
+TEST_F(OPTreeTest, RenamedFolderCarriesPendingWorkToTheNewNameAfterTheRename) {
+  OPTree tree(WriteQueue({
+      R"({"event":2,"path":"/s/old/f"})",
+      R"({"event":128,"path":"/s/old/g"})",
+      R"({"event":4,"path":"/s/old/h/i"})",
+      R"({"event":256,"path":"/s/new","path_old":"/s/old"})",
+  }));
+  std::vector<std::string> got;
+  unsigned count = tree.ProcessOP([&](std::shared_ptr<OP> op) { got.push_back(Print(op)); });
+  // The delete is not carried: the old document is removed under its old name.
+  EXPECT_EQ(got, (std::vector<std::string>{"[01] /s/old/g", "[05] /s/old -> /s/new",
+                                           "[02] /s/new/f", "[03] /s/new/h/i"}))
+      << Join(got);
+  EXPECT_EQ(count, 6u);
+  // Only paths with work to carry are mirrored under the new name.
+  std::shared_ptr<OPNode> new_node = tree.GetNodeByPath("/s/new");
+  std::vector<std::string> names;
+  for (const auto& c : new_node->children) names.push_back(c->name);
+  EXPECT_EQ(names, (std::vector<std::string>{"f", "h"}));
+}
+
+TEST_F(OPTreeTest, RenameThereAndBackKeepsWorkOnTheOriginalName) {
+  Folded f = Fold({
+      R"({"event":2,"path":"/s/a/f"})",
+      R"({"event":256,"path":"/s/b","path_old":"/s/a"})",
+      R"({"event":256,"path":"/s/a","path_old":"/s/b"})",
+  });
+  EXPECT_EQ(f.delivered,
+            (std::vector<std::string>{"[05] /s/a -> /s/b", "[05] /s/b -> /s/a", "[02] /s/a/f"}))
+      << Join(f.delivered);
+  EXPECT_EQ(f.count, 5u);
+}
+
+// Regression: a rename bit whose old path is refused used to turn the
+// operation that an earlier bit of the same line had attached into a rename
+// with that bad old path.
+TEST_F(OPTreeTest, RefusedOldPathLeavesTheEarlierBitsOfTheLineAlone) {
+  for (const char* bad_old : {"", "s/a", "/s//a", "/s/a/"}) {
+    Json::Value line(Json::objectValue);
+    line["event"] = 0x2 | 0x100;
+    line["path"] = "/s/b";
+    line["path_old"] = bad_old;
+    platform_.ClearLogs();
+    Folded f = Fold({JsonToString(line)});
+    EXPECT_EQ(f.delivered, (std::vector<std::string>{"[02] /s/b"}))
+        << "path_old=" << bad_old << Join(f.delivered);
+    EXPECT_EQ(platform_.LogsContaining("code=9999").size(), 1u) << "path_old=" << bad_old;
+  }
+}
+
+TEST_F(OPTreeTest, CrashMarkerStopsReadingAndDeliversOnlyTheCrash) {
+  OPTree tree(WriteQueue({
+      R"({"event":2,"path":"/s/a"})",
+      R"({"event":512,"path":"/s/b"})",
+      "not json after the crash",
+  }));
+  std::vector<std::shared_ptr<OP>> got;
+  unsigned count = tree.ProcessOP([&](std::shared_ptr<OP> op) { got.push_back(op); });
+  ASSERT_EQ(got.size(), 1u);
+  EXPECT_EQ(got[0]->op, FILE_INDEX_OP_CRASH);
+  EXPECT_EQ(got[0]->node, tree.root);
+  EXPECT_EQ(count, 1u);
+  EXPECT_EQ(platform_.LogsContaining("Queue crashed: " + queue_).size(), 1u);
+  EXPECT_TRUE(platform_.LogsContaining("not json after the crash").empty());
+}
+
+TEST_F(OPTreeTest, EmptyQueueDeliversNothing) {
+  testing::WriteFile(queue_, "");
+  OPTree tree(queue_);
+  int calls = 0;
+  EXPECT_EQ(tree.ProcessOP([&](std::shared_ptr<OP>) { ++calls; }), 0u);
+  EXPECT_EQ(calls, 0);
+}
+
+TEST_F(OPTreeTest, ExceptionFromTheCallbackStopsDelivery) {
+  OPTree tree(WriteQueue({R"({"event":2,"path":"/s/a"})", R"({"event":2,"path":"/s/b"})"}));
+  std::vector<std::string> got;
+  EXPECT_THROW(tree.ProcessOP([&](std::shared_ptr<OP> op) {
+    got.push_back(Print(op));
+    throw Error(kErrBusy, "busy");
+  }),
+               Error);
+  EXPECT_EQ(got, (std::vector<std::string>{"[02] /s/a"}));
+}
+
+TEST_F(OPTreeTest, GetNodeByPathReturnsOneNodePerPathInCreationOrder) {
+  OPTree tree(WriteQueue({}));
+  std::shared_ptr<OPNode> a = tree.GetNodeByPath("/volume1/share/a");
+  EXPECT_EQ(tree.GetNodeByPath("/volume1/share/a"), a);
+  EXPECT_EQ(a->GetPath(), "/volume1/share/a");
+  tree.GetNodeByPath("/volume1/share/b");
+  tree.GetNodeByPath("/volume1/share/ab");
+  std::shared_ptr<OPNode> share = tree.GetNodeByPath("/volume1/share");
+  EXPECT_EQ(a->parent, share);
+  std::vector<std::string> names;
+  for (const auto& c : share->children) names.push_back(c->name);
+  EXPECT_EQ(names, (std::vector<std::string>{"a", "b", "ab"}));
+}
+
+TEST_F(OPTreeTest, GetNodeByPathRefusesPathsThatAreNotCanonical) {
+  OPTree tree(WriteQueue({}));
+  const std::string longest = [] {
+    std::string p;
+    while (p.size() + 2 <= OPTree::kMaxPathBytes) p += "/a";
+    return p + std::string(OPTree::kMaxPathBytes - p.size(), 'b');
+  }();
+  ASSERT_EQ(longest.size(), 4095u);
+  EXPECT_EQ(tree.GetNodeByPath(longest)->GetPath(), longest);
+  for (const std::string& bad :
+       {std::string(), std::string("/"), std::string("volume1/share"), std::string("/a//b"),
+        std::string("/a/"), std::string("/a/./b"), std::string("/a/../b"), std::string("/."),
+        std::string("//a"), longest + "c"}) {
+    try {
+      tree.GetNodeByPath(bad);
+      ADD_FAILURE() << "accepted: \"" << bad << "\"";
+    } catch (const Error& e) {
+      EXPECT_EQ(e.GetCode(), kErrNodeByPath) << bad;
+      EXPECT_EQ(std::string(e.what()), "GetNodeByPath failed, path=" + bad);
+    }
+  }
+  // Names that merely begin with dots are ordinary names.
+  EXPECT_EQ(tree.GetNodeByPath("/a/.b/..c/...")->GetPath(), "/a/.b/..c/...");
+}
+
+// Regression: a child made with OPNode::GetChild was unknown to the tree's
+// index, and GetNodeByPath made a second node of the same name beside it.
+TEST_F(OPTreeTest, ChildMadeWithGetChildIsTheNodeOfItsPath) {
+  OPTree tree(WriteQueue({}));
+  std::shared_ptr<OPNode> a = tree.GetNodeByPath("/v/a");
+  EXPECT_EQ(a->parent->GetChild("a"), a);
+  std::shared_ptr<OPNode> b = a->parent->GetChild("b");
+  std::shared_ptr<OPNode> d = b->GetChild("d");
+  EXPECT_EQ(tree.GetNodeByPath("/v/b/d"), d);
+  EXPECT_EQ(tree.GetNodeByPath("/v/b"), b);
+  EXPECT_EQ(tree.GetNodeByPath("/v/b/c")->parent, b);
+  EXPECT_EQ(a->parent->children.size(), 2u);
+  EXPECT_EQ(b->children.size(), 2u);
+}
+
+TEST_F(OPTreeTest, ReindexOfAShallowFolderCancelsWorkOnAVeryDeepPath) {
+  std::string deep = "/s";
+  while (deep.size() + 2 <= OPTree::kMaxPathBytes) deep += "/d";
+  Folded f = Fold({R"({"event":2,"path":")" + deep + R"("})",
+                   R"({"event":65536,"path":"/s"})"});
+  EXPECT_EQ(f.delivered, (std::vector<std::string>{"[06] /s"}));
+  EXPECT_EQ(f.count, 2u);
+}
+
+TEST_F(OPTreeTest, PrintsOperationsAndNodes) {
+  OPTree tree(WriteQueue({}));
+  auto node = [&](const char* p) { return tree.GetNodeByPath(p); };
+  struct Case {
+    std::shared_ptr<OP> op;
+    std::string printed;
+  } cases[] = {
+      {std::make_shared<OP>(node("/volume1/share/a.txt"), FILE_INDEX_OP_UPSERT, "", Json::Value()),
+       "[02] /volume1/share/a.txt"},
+      {std::make_shared<OP>(node("/volume1/share/new"), FILE_INDEX_OP_RENAME,
+                            "/volume1/share/old", Json::Value()),
+       "[05] /volume1/share/old -> /volume1/share/new"},
+      {std::make_shared<OP>(node("/volume1/share/d"), FILE_INDEX_OP_REINDEX, "", Json::Value()),
+       "[06] /volume1/share/d"},
+      {std::make_shared<OP>(node("/volume1/share/d"), FILE_INDEX_OP_UPDATE_CFG, "",
+                            ParseJson(R"({"photo":true,"audio":false})")),
+       R"([04] /volume1/share/d, data={"audio":false,"photo":true})"},
+  };
+  for (const auto& c : cases) EXPECT_EQ(Print(c.op), c.printed);
+
+  std::shared_ptr<OPNode> n = node("/volume1/share/x");
+  n->ops.push_back(std::make_shared<OP>(n, FILE_INDEX_OP_ATTR, "", Json::Value()));
+  n->ops.push_back(std::make_shared<OP>(n, FILE_INDEX_OP_DELETE, "", Json::Value()));
+  std::ostringstream os;
+  os << n;
+  EXPECT_EQ(os.str(), "Node[/volume1/share/x]: [03] /volume1/share/x, [01] /volume1/share/x");
+}
+
+// The incoming flags are read with the JSON helper, so they convert as the
+// JSON library converts a value to a boolean: "video": 1 and "audio": 0.5
+// count as true (a reader might expect them to count as false, but the
+// helper deliberately keeps the library's rules), null is false, and a string
+// is no boolean at all and leaves the default false. The pending side counts
+// only a real true.
+TEST(OPMergeDataTest, OrsTheFourCategoryFlagsAsTheJsonHelperReadsThem) {
+  struct Case {
+    const char* data;
+    const char* other;
+    const char* merged;
+  } cases[] = {
+      {R"({"audio":true})", R"({"document":true})",
+       R"({"audio":true,"document":true,"photo":false,"video":false})"},
+      {R"({"audio":true})", R"({"video":1})",
+       R"({"audio":true,"document":false,"photo":false,"video":true})"},
+      {R"({})", R"({"document":"yes","audio":0.5,"photo":null})",
+       R"({"audio":true,"document":false,"photo":false,"video":false})"},
+      {R"({"video":true})", R"({"video":false})",
+       R"({"audio":false,"document":false,"photo":false,"video":true})"},
+      {R"({"photo":"yes"})", R"({})",
+       R"({"audio":false,"document":false,"photo":false,"video":false})"},
+      {R"({"other":"x"})", R"({"other":"y","photo":true})",
+       R"({"audio":false,"document":false,"other":"x","photo":true,"video":false})"},
+      {"null", R"({"audio":true})",
+       R"({"audio":true,"document":false,"photo":false,"video":false})"},
+      {R"({"document":true})", "5",
+       R"({"audio":false,"document":true,"photo":false,"video":false})"},
+  };
+  for (const auto& c : cases) {
+    OP op(nullptr, FILE_INDEX_OP_UPDATE_CFG, "", ParseJson(c.data));
+    op.MergeData(ParseJson(c.other));
+    EXPECT_EQ(op.data, ParseJson(c.merged))
+        << c.data << " merged with " << c.other << " gave " << JsonToString(op.data);
+  }
+}
+
+TEST(OPMergeDataTest, MergingItsOwnDataKeepsTheFlags) {
+  OP op(nullptr, FILE_INDEX_OP_UPDATE_CFG, "", ParseJson(R"({"audio":true,"photo":1})"));
+  op.MergeData(op.data);
+  // The stored 1 is no real true on the pending side, but the same 1 read
+  // as the incoming flag is.
+  EXPECT_EQ(op.data, ParseJson(R"({"audio":true,"document":false,"photo":true,"video":false})"))
+      << JsonToString(op.data);
+}
+
+}  // namespace
+}  // namespace vellis::fileindex
