@@ -35,6 +35,14 @@ bool IsCanonicalPath(const std::string& path) {
   }
 }
 
+// Visits the operations pending on `node` when the visit starts, in
+// attachment order; a rule may attach to this very node meanwhile, and what
+// it attaches is not visited.
+template <typename Fn>
+void ForEachPending(const OPNode& node, Fn fn) {
+  for (size_t i = 0, n = node.ops.size(); i < n; ++i) fn(node.ops[i]);
+}
+
 bool IsCarriable(FileIndexOP kind) {
   return kind == FILE_INDEX_OP_UPSERT || kind == FILE_INDEX_OP_ATTR ||
          kind == FILE_INDEX_OP_REINDEX;
@@ -216,12 +224,13 @@ void OPTree::BuildTree() {
   VELLIS_THROW_IF(!reader.Open(queue_path), kErrInternal,
                   std::string("Failed to open queue, reason=") + strerror(errno));
   std::string_view line;
+  std::string raw;  // reused: one line at a time, no allocation per line
   for (;;) {
     LineReader::Status status = reader.Next(&line);
     if (status == LineReader::Status::kEnd) break;
     VELLIS_THROW_IF(status == LineReader::Status::kError, kErrInternal,
                     std::string("Failed to read queue, reason=") + strerror(errno));
-    std::string raw(line);
+    raw.assign(line.data(), line.size());
     if (status == LineReader::Status::kTooLong) {
       VELLIS_LOG_ERRNO("InsertEvent failed, event_raw=%s..., code=%d, reason=%s", raw.c_str(),
                        static_cast<int>(kErrMalformedEvent), "line of 1 MiB or more skipped");
@@ -351,9 +360,9 @@ void OPTree::InsertEvent(std::shared_ptr<Event> event) {
 // operation `e` of the node in attachment order (all of them: a traversal
 // does not stop at a match), and is attached when still not cancelled.
 
-void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+void OPTree::HandleCreate(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_UPSERT;
-  node->TraverseOP([&](std::shared_ptr<OP> e) {
+  ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
     switch (e->op) {
       case FILE_INDEX_OP_DELETE:  // a create revives a deleted path
@@ -370,9 +379,9 @@ void OPTree::HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) 
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+void OPTree::HandleModify(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_UPSERT;
-  node->TraverseOP([&](std::shared_ptr<OP> e) {
+  ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
     switch (e->op) {
       case FILE_INDEX_OP_ATTR:
@@ -388,9 +397,9 @@ void OPTree::HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) 
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+void OPTree::HandleDelete(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_DELETE;
-  node->TraverseOP([&](std::shared_ptr<OP> e) {
+  ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
     switch (e->op) {
       case FILE_INDEX_OP_DELETE:
@@ -408,17 +417,17 @@ void OPTree::HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) 
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+void OPTree::HandleAttr(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_ATTR;
-  node->TraverseOP([&](std::shared_ptr<OP> e) {
+  ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (IsLive(e) && e->op != FILE_INDEX_OP_RENAME) op->op = FILE_INDEX_OP_NONE;
   });
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+void OPTree::HandleUpdateCfg(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_UPDATE_CFG;
-  node->TraverseOP([&](std::shared_ptr<OP> e) {
+  ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
     switch (e->op) {
       case FILE_INDEX_OP_UPSERT:
@@ -440,9 +449,9 @@ void OPTree::HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> o
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+void OPTree::HandleReindex(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_REINDEX;
-  node->TraverseOP([&](std::shared_ptr<OP> e) {
+  ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
     switch (e->op) {
       case FILE_INDEX_OP_UPSERT:
@@ -473,7 +482,7 @@ void OPTree::HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op)
 void OPTree::CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to) {
   auto follow_up = std::make_shared<OP>(to, FILE_INDEX_OP_NONE, "", Json::Value());
   bool attached = false;
-  from->TraverseOP([&](std::shared_ptr<OP> e) {
+  ForEachPending(*from, [&](const std::shared_ptr<OP>& e) {
     if (!IsCarriable(e->op)) return;
     follow_up->op = e->op;
     e->op = FILE_INDEX_OP_NONE;
@@ -484,13 +493,13 @@ void OPTree::CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_pt
   });
 }
 
-void OPTree::HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op) {
+void OPTree::HandleRename(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
   // Resolve the old path first: a bad one refuses the line before anything
   // changes, also the kind of `op` when an earlier bit of the line attached it.
   std::shared_ptr<OPNode> old_node = GetNodeByPath(op->path_old);
   op->op = FILE_INDEX_OP_RENAME;
   // Whatever was pending at the destination is superseded by the moved item.
-  node->TraverseOP([&](std::shared_ptr<OP> e) {
+  ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (e->op == FILE_INDEX_OP_DELETE || e->op == FILE_INDEX_OP_UPSERT ||
         e->op == FILE_INDEX_OP_ATTR) {
       e->op = FILE_INDEX_OP_NONE;

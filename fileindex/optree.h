@@ -165,13 +165,13 @@ class OPTree {
   // the index; true when there were any.
   bool IndexNewChildren(OPNode* node);
   void Attach(const std::shared_ptr<OP>& op);
-  void HandleCreate(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
-  void HandleModify(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
-  void HandleDelete(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
-  void HandleAttr(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
-  void HandleUpdateCfg(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
-  void HandleReindex(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
-  void HandleRename(std::shared_ptr<OPNode> node, std::shared_ptr<OP> op);
+  void HandleCreate(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+  void HandleModify(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+  void HandleDelete(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+  void HandleAttr(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+  void HandleUpdateCfg(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+  void HandleReindex(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+  void HandleRename(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
   // Moves pending upsert/attr/reindex work of `from` onto `to`.
   void CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to);
 
