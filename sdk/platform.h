@@ -204,8 +204,7 @@ class PlatformWrapper : public Platform {
                            size_t path_size) override {
     return target_->QORUShareNamePathGet(full_path, name, name_size, path, path_size);
   }
-  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes,
-                        int flags) override {
+  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes, int flags) override {
     return target_->QORUQuotaIsEnough(uid, path, bytes, flags);
   }
   int FILEIDXQueuePathCompose(const std::string& share_path, char* buf, size_t size) override {

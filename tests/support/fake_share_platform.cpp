@@ -160,8 +160,7 @@ int FakeSharePlatform::QLIBShareHideUnreadableGet(const sdk::ShareInfo& share, i
   return 0;
 }
 
-int FakeSharePlatform::QORUShareUserPrivGet(const std::string& user,
-                                            const sdk::ShareInfo& share) {
+int FakeSharePlatform::QORUShareUserPrivGet(const std::string& user, const sdk::ShareInfo& share) {
   if (Fails("QORUShareUserPrivGet", user)) return -1;
   return FakePlatform::QORUShareUserPrivGet(user, share);
 }
@@ -201,8 +200,7 @@ int FakeSharePlatform::FILEIDXQueuePathCompose(const std::string& share_path, ch
   return FakePlatform::FILEIDXQueuePathCompose(share_path, buf, size);
 }
 
-int FakeSharePlatform::FILEIDXDBPathCompose(const std::string& share_path, char* buf,
-                                            size_t size) {
+int FakeSharePlatform::FILEIDXDBPathCompose(const std::string& share_path, char* buf, size_t size) {
   if (Fails("FILEIDXDBPathCompose", share_path)) return -1;
   return FakePlatform::FILEIDXDBPathCompose(share_path, buf, size);
 }

@@ -62,8 +62,7 @@ class FakeSharePlatform : public FakePlatform {
   int QORUShareUserPrivGet(const std::string& user, const sdk::ShareInfo& share) override;
   int QORUShareNamePathGet(const std::string& full_path, char* name, size_t name_size, char* path,
                            size_t path_size) override;
-  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes,
-                        int flags) override;
+  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes, int flags) override;
   int FILEIDXQueuePathCompose(const std::string& share_path, char* buf, size_t size) override;
   int FILEIDXDBPathCompose(const std::string& share_path, char* buf, size_t size) override;
   int FILEIDXGetIndexID(const std::string& share_name, char* buf, size_t size) override;
