@@ -31,8 +31,8 @@ this line is not JSON
 QUEUE
 
 echo "== queue: $(wc -l < "$queue") lines"
-echo "== vellis queue fold (each surviving operation, then the count)"
-"$VELLIS" queue fold "$queue"
+echo "== vellis -v queue fold (skipped lines are logged; each surviving operation, then the count)"
+"$VELLIS" -v queue fold "$queue"
 echo "== vellis queue pending (before rotation)"
 "$VELLIS" queue pending "$queue" "$share/2020"
 echo "== vellis queue rotate"

@@ -1,0 +1,305 @@
+// Folding queue files into the operation tree, against reading and parsing
+// the same lines alone.
+//
+// Cases: a realistic queue (1,000,000 lines over about 50,000 folders, a mix
+// of every kind of event) and a wide one (100,000 new files in one folder)
+// against the same number spread over 1,000 folders. After the runs it
+// prints folding as a ratio to parsing and to reading, the wide/spread
+// ratio, and the heap held per tree node.
+//
+//   build/bench/optree_bench [--benchmark_filter=...]
+#include <benchmark/benchmark.h>
+#include <malloc.h>
+#include <sys/resource.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <fstream>
+#include <map>
+#include <memory>
+#include <random>
+#include <string>
+
+#include "common/json_util.h"
+#include "common/line_reader.h"
+#include "fileindex/optree.h"
+
+namespace {
+
+using vellis::fileindex::OP;
+using vellis::fileindex::OPNode;
+using vellis::fileindex::OPTree;
+
+std::string TempDir() {
+  static std::string dir = [] {
+    const char* tmp = getenv("TMPDIR");
+    std::string tmpl = std::string(tmp && *tmp ? tmp : "/tmp") + "/vellis-bench-XXXXXX";
+    if (mkdtemp(&tmpl[0]) == nullptr) abort();
+    return tmpl;
+  }();
+  return dir;
+}
+
+std::string Line(unsigned event, bool is_dir, const std::string& path,
+                 const std::string& path_old = "", const char* data = nullptr) {
+  std::string s = "{\"event\":" + std::to_string(event) + ",\"is_dir\":" +
+                  (is_dir ? "true" : "false") + ",\"path\":\"" + path + "\"";
+  if (!path_old.empty()) s += ",\"path_old\":\"" + path_old + "\"";
+  if (data) s += std::string(",\"data\":") + data;
+  return s + "}\n";
+}
+
+// 50 x 50 x 20 = 50,000 leaf folders under one share. Events come in bursts
+// of a few to a few dozen in one folder (a copy, a save, an unpack), with
+// files drawn with a skew towards low numbers, so paths repeat as they do
+// on a busy share.
+std::string MakeRealistic(size_t lines) {
+  std::string path = TempDir() + "/realistic.queue";
+  std::ofstream out(path);
+  std::mt19937 rng(42);
+  std::uniform_int_distribution<int> a(0, 49), b(0, 49), c(0, 19), pct(0, 999);
+  std::geometric_distribution<int> file(0.08), burst(0.1);
+  size_t written = 0;
+  while (written < lines) {
+    const std::string d = "/volume1/share/d" + std::to_string(a(rng)) + "/e" +
+                          std::to_string(b(rng)) + "/f" + std::to_string(c(rng));
+    for (int n = burst(rng) + 1; n > 0 && written < lines; --n, ++written) {
+      std::string f = d + "/file" + std::to_string(file(rng)) + ".txt";
+      int p = pct(rng);
+      if (p < 400) {
+        out << Line(0x2, false, f);
+      } else if (p < 550) {
+        out << Line(0x40, false, f);
+      } else if (p < 650) {
+        out << Line(0x4, false, f);
+      } else if (p < 750) {
+        out << Line(0x80, false, f);
+      } else if (p < 850) {
+        out << Line(0x42, false, f);
+      } else if (p < 900) {
+        out << Line(0x6, false, f);
+      } else if (p < 960) {
+        out << Line(0x100, false, f, d + "/file" + std::to_string(file(rng)) + ".txt");
+      } else if (p < 970) {
+        out << Line(0x40, true, d + "/sub" + std::to_string(file(rng)));
+      } else if (p < 980) {
+        out << Line(0x80, true, d + "/sub" + std::to_string(file(rng)));
+      } else if (p < 990) {
+        out << Line(0x10000, false, d);
+      } else {
+        out << Line(0x20000, false, d, "", "{\"document\":true,\"photo\":false}");
+      }
+    }
+  }
+  return path;
+}
+
+// `files` new files in `dirs` folders, one create each.
+std::string MakeSpread(size_t files, size_t dirs, const std::string& name) {
+  std::string path = TempDir() + "/" + name + ".queue";
+  std::ofstream out(path);
+  for (size_t i = 0; i < files; ++i) {
+    out << Line(0x40, false,
+                "/volume1/share/dir" + std::to_string(i % dirs) + "/file" + std::to_string(i) +
+                    ".jpg");
+  }
+  return path;
+}
+
+const std::string& Queue(const std::string& which) {
+  static std::map<std::string, std::string> queues;
+  auto it = queues.find(which);
+  if (it != queues.end()) return it->second;
+  std::string path;
+  if (which == "realistic") path = MakeRealistic(1000000);
+  if (which == "wide") path = MakeSpread(100000, 1, "wide");
+  if (which == "spread") path = MakeSpread(100000, 1000, "spread");
+  return queues[which] = path;
+}
+
+void BM_Read(benchmark::State& state, const std::string& which) {
+  const std::string& path = Queue(which);
+  size_t lines = 0;
+  for (auto _ : state) {
+    vellis::LineReader reader;
+    if (!reader.Open(path)) abort();
+    std::string_view line;
+    lines = 0;
+    while (reader.Next(&line) == vellis::LineReader::Status::kLine) {
+      benchmark::DoNotOptimize(line.data());
+      ++lines;
+    }
+  }
+  state.counters["lines"] = static_cast<double>(lines);
+}
+
+void BM_ReadParse(benchmark::State& state, const std::string& which) {
+  const std::string& path = Queue(which);
+  for (auto _ : state) {
+    vellis::LineReader reader;
+    if (!reader.Open(path)) abort();
+    std::string_view line;
+    while (reader.Next(&line) == vellis::LineReader::Status::kLine) {
+      Json::Value v;
+      bool ok = vellis::JsonFromString(v, std::string(line));
+      benchmark::DoNotOptimize(ok);
+    }
+  }
+}
+
+// Reading plus turning each line into an Event (the parse and the field
+// checks), without the tree.
+void BM_ReadEvents(benchmark::State& state, const std::string& which) {
+  const std::string& path = Queue(which);
+  for (auto _ : state) {
+    vellis::LineReader reader;
+    if (!reader.Open(path)) abort();
+    std::string_view line;
+    while (reader.Next(&line) == vellis::LineReader::Status::kLine) {
+      auto e = std::make_shared<vellis::fileindex::Event>(std::string(line));
+      benchmark::DoNotOptimize(e.get());
+    }
+  }
+}
+
+size_t CountNodes(const std::shared_ptr<OPNode>& root) {
+  size_t n = 0;
+  std::vector<OPNode*> stack{root.get()};
+  while (!stack.empty()) {
+    OPNode* node = stack.back();
+    stack.pop_back();
+    ++n;
+    for (const auto& c : node->children) stack.push_back(c.get());
+  }
+  return n;
+}
+
+struct TreeStats {
+  size_t nodes = 0;
+  size_t ops = 0;
+  size_t delivered = 0;
+  size_t heap = 0;
+};
+std::map<std::string, TreeStats> g_stats;
+
+void BM_Fold(benchmark::State& state, const std::string& which) {
+  const std::string& path = Queue(which);
+  for (auto _ : state) {
+    size_t before = mallinfo2().uordblks;
+    OPTree tree(path);
+    size_t delivered = 0;
+    tree.ProcessOP([&](std::shared_ptr<OP>) { ++delivered; });
+    state.PauseTiming();
+    TreeStats s;
+    s.heap = mallinfo2().uordblks - before;
+    s.nodes = CountNodes(tree.root);
+    s.ops = tree.ops.size();
+    s.delivered = delivered;
+    g_stats[which] = s;
+    state.ResumeTiming();
+  }
+  state.counters["nodes"] = static_cast<double>(g_stats[which].nodes);
+  state.counters["ops"] = static_cast<double>(g_stats[which].ops);
+}
+
+// Heap held per node by the tree structure alone: the nodes of every path of
+// a queue made through the tree's own lookup, without any operation.
+double BytesPerNode(const std::string& which, size_t* nodes) {
+  std::vector<std::string> paths;
+  {
+    vellis::LineReader reader;
+    if (!reader.Open(Queue(which))) abort();
+    std::string_view line;
+    while (reader.Next(&line) == vellis::LineReader::Status::kLine) {
+      paths.push_back(vellis::fileindex::Event(std::string(line)).path);
+    }
+  }
+  std::string empty = TempDir() + "/empty.queue";
+  std::ofstream(empty).close();
+  size_t before = mallinfo2().uordblks;
+  OPTree tree(empty);
+  for (const auto& p : paths) tree.GetNodeByPath(p);
+  size_t heap = mallinfo2().uordblks - before;
+  *nodes = CountNodes(tree.root);
+  return static_cast<double>(heap) / static_cast<double>(*nodes);
+}
+
+// Heap held by one attached operation (the object and its two slots).
+double BytesPerOp() {
+  constexpr int kN = 100000;
+  auto node = std::make_shared<OPNode>(nullptr, "n");
+  std::vector<std::shared_ptr<OP>> a, b;
+  a.reserve(kN);
+  b.reserve(kN);
+  size_t before = mallinfo2().uordblks;
+  for (int i = 0; i < kN; ++i) {
+    a.push_back(std::make_shared<OP>(node, vellis::fileindex::FILE_INDEX_OP_UPSERT, "",
+                                     Json::Value()));
+  }
+  size_t objects = mallinfo2().uordblks - before;
+  b = a;
+  return static_cast<double>(objects) / kN + 2 * sizeof(std::shared_ptr<OP>);
+}
+
+// Keeps each run's time so that main() can print the ratios.
+class RatioReporter : public benchmark::ConsoleReporter {
+ public:
+  void ReportRuns(const std::vector<Run>& runs) override {
+    for (const auto& r : runs) {
+      if (r.run_type == Run::RT_Iteration && r.iterations > 0) {
+        seconds_[r.benchmark_name()] = r.cpu_accumulated_time / static_cast<double>(r.iterations);
+      }
+    }
+    ConsoleReporter::ReportRuns(runs);
+  }
+  double Seconds(const std::string& name) const {
+    auto it = seconds_.find(name);
+    return it == seconds_.end() ? 0 : it->second;
+  }
+
+ private:
+  std::map<std::string, double> seconds_;
+};
+
+}  // namespace
+
+BENCHMARK_CAPTURE(BM_Read, realistic, std::string("realistic"))->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(BM_ReadParse, realistic, std::string("realistic"))
+    ->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(BM_ReadEvents, realistic, std::string("realistic"))
+    ->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(BM_Fold, realistic, std::string("realistic"))->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(BM_ReadParse, wide, std::string("wide"))->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(BM_Fold, wide, std::string("wide"))->Unit(benchmark::kMillisecond);
+BENCHMARK_CAPTURE(BM_Fold, spread, std::string("spread"))->Unit(benchmark::kMillisecond);
+
+int main(int argc, char** argv) {
+  benchmark::Initialize(&argc, argv);
+  RatioReporter reporter;
+  benchmark::RunSpecifiedBenchmarks(&reporter);
+
+  auto ratio = [&](const char* a, const char* b) {
+    double sa = reporter.Seconds(a), sb = reporter.Seconds(b);
+    return sb > 0 ? sa / sb : 0.0;
+  };
+  printf("\nfold / read+parse (realistic): %.2f  (target <= 1.5)\n",
+         ratio("BM_Fold/realistic", "BM_ReadParse/realistic"));
+  printf("fold / read alone (realistic): %.2f\n", ratio("BM_Fold/realistic", "BM_Read/realistic"));
+  printf("fold wide / fold spread:       %.2f  (target <= 2)\n",
+         ratio("BM_Fold/wide", "BM_Fold/spread"));
+  double per_op = BytesPerOp();
+  printf("heap per attached operation:   %.0f bytes\n", per_op);
+  for (const auto& [name, s] : g_stats) {
+    size_t nodes = 0;
+    double per_node = BytesPerNode(name, &nodes);
+    printf("%-10s nodes %8zu  ops %8zu  delivered %8zu  heap of the folded tree %6.1f MiB\n"
+           "           tree structure alone: %5.0f bytes per node (target < 200 + name)\n",
+           name.c_str(), s.nodes, s.ops, s.delivered, s.heap / 1048576.0, per_node);
+  }
+  rusage ru;
+  getrusage(RUSAGE_SELF, &ru);
+  printf("peak RSS of the whole run:     %.1f MiB\n", ru.ru_maxrss / 1024.0);
+  benchmark::Shutdown();
+  std::string cmd = "rm -rf '" + TempDir() + "'";
+  return system(cmd.c_str()) == 0 ? 0 : 1;
+}
