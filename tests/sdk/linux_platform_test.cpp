@@ -5,12 +5,14 @@
 #include <fcntl.h>
 #include <grp.h>
 #include <gtest/gtest.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdlib>
 #include <string>
+#include <thread>
 
 #include "sdk/linux/file_systems.h"
 #include "sdk/linux/process.h"
@@ -168,6 +170,42 @@ TEST_F(LinuxPlatformTest, UsersAndTheAdministratorsGroup) {
   if (getgrnam(kDefaultAdminGroup) == nullptr) {
     EXPECT_EQ(group, kFallbackAdminGroup);
   }
+}
+
+TEST_F(LinuxPlatformTest, LastErrorBelongsToTheThread) {
+  EXPECT_LT(platform_.QORUGetFSType(root_.Path("/missing"), 0), 0);
+  std::thread other([this] {
+    EXPECT_EQ(platform_.QLIBCErrGet(), 0);
+    EXPECT_EQ(platform_.QORUQuotaIsEnough(0, root_.path(), 1ULL << 62, 0), 0);
+    EXPECT_EQ(platform_.QLIBCErrGet(), kPlatformErrNoSpace);
+  });
+  other.join();
+  EXPECT_EQ(platform_.QLIBCErrGet(), ENOENT);
+}
+
+TEST_F(LinuxPlatformTest, UserPrivilegeFollowsTheShareFolderBits) {
+  if (geteuid() != 0) GTEST_SKIP() << "needs root to own the folders";
+  struct Case {
+    mode_t mode;
+    std::string user;
+    int priv;
+  } cases[] = {
+      {0700, "nobody", kSharePrivNoAccess}, {0755, "nobody", kSharePrivReadOnly},
+      {0751, "nobody", kSharePrivNoAccess}, {0777, "nobody", kSharePrivReadWrite},
+      {0700, "root", kSharePrivReadWrite},
+  };
+  for (const Case& c : cases) {
+    ShareInfo share;
+    share.szName = "s" + std::to_string(c.mode);
+    share.szPath = root_.Path("/volume1/" + share.szName);
+    testing::MakeDirs(share.szPath);
+    ASSERT_EQ(0, chmod(share.szPath.c_str(), c.mode));
+    EXPECT_EQ(platform_.QORUShareUserPrivGet(c.user, share), c.priv)
+        << std::oct << c.mode << " " << c.user;
+  }
+  ShareInfo share;
+  share.szPath = root_.path();
+  EXPECT_LT(platform_.QORUShareUserPrivGet("no-such-user-vellis", share), 0);
 }
 
 TEST_F(LinuxPlatformTest, ProcessThatIsNotRootMayNotSwitch) {
