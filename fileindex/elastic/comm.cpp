@@ -29,28 +29,6 @@ void WaitForSocket(const std::string& path) {
   errno = 0;
 }
 
-// Sub-request failures are partial: the caller's loop repeats the whole
-// compound request only when the daemon was busy for one of them.
-void CheckCompound(const Json::Value& res, const Json::Value& req, const std::string& raw) {
-  const Json::Value& data = res["data"];
-  VELLIS_THROW_IF(!data.isArray(), kErrDaemonUnreachable,
-                  "Compound answer without data array, res=" + raw);
-  const Json::Value& subs = req["compound"];
-  for (Json::ArrayIndex i = 0; i < data.size(); ++i) {
-    const Json::Value& sub = data[i];
-    if (sub.isObject() && sub["success"].isBool() && sub["success"].asBool()) continue;
-    Json::Value error;
-    GetJsonValue(error, sub, "error", true);
-    int code = 0;
-    std::string msg;
-    GetJsonValue(code, error, "code", true);
-    GetJsonValue(msg, error, "msg", false);
-    if (IsBusyCode(code)) throw Error(static_cast<ErrorCode>(code), msg);
-    std::string sub_text = subs.isArray() && i < subs.size() ? JsonToString(subs[i]) : "null";
-    VELLIS_LOG_ERRNO("Compound failed: %s (%d) %s", sub_text.c_str(), code, msg.c_str());
-  }
-}
-
 }  // namespace
 
 RequestTimeouts TEST_SetRequestTimeouts(RequestTimeouts timeouts) {
@@ -86,9 +64,29 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req) {
     throw Error(static_cast<ErrorCode>(code), "Request failed, msg=" + msg);
   }
 
-  if (req.isObject() && req.isMember("compound") && res.isMember("has_fail") &&
-      res["has_fail"].isBool() && res["has_fail"].asBool()) {
-    CheckCompound(res, req, resp_raw);
+  const Json::Value& answer = res;  // const access never adds members
+  if (!req.isObject() || !req.isMember("compound") || !answer["has_fail"].isBool() ||
+      !answer["has_fail"].asBool()) {
+    return;
+  }
+  // Sub-request failures are partial: the caller's loop repeats the whole
+  // compound request only when the daemon was busy for one of them.
+  const Json::Value& data = answer["data"];
+  VELLIS_THROW_IF(!data.isArray(), kErrDaemonUnreachable,
+                  "Compound answer without data array, res=" + resp_raw);
+  const Json::Value& subs = req["compound"];
+  for (Json::ArrayIndex i = 0; i < data.size(); ++i) {
+    const Json::Value& sub = data[i];
+    if (sub.isObject() && sub["success"].isBool() && sub["success"].asBool()) continue;
+    Json::Value error;
+    GetJsonValue(error, sub, "error", true);
+    int code = 0;
+    std::string msg;
+    GetJsonValue(code, error, "code", true);
+    GetJsonValue(msg, error, "msg", false);
+    if (IsBusyCode(code)) throw Error(static_cast<ErrorCode>(code), msg);
+    std::string sub_text = subs.isArray() && i < subs.size() ? JsonToString(subs[i]) : "null";
+    VELLIS_LOG_ERRNO("Compound failed: %s (%d) %s", sub_text.c_str(), code, msg.c_str());
   }
 }
 

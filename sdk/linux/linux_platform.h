@@ -20,6 +20,9 @@ class LinuxPlatform : public Platform {
                    const CopyArgs& args) override;
 
   int QORUUserGet(const std::string& name, UserInfo* out) override;
+
+  // In sdk/linux/content_extract.cpp.
+  int ParseFile(const std::string& path, const Json::Value& options, Json::Value* doc) override;
 };
 
 }  // namespace vellis::sdk
