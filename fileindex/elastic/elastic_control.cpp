@@ -6,7 +6,9 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "fileindex/elastic/comm.h"
+#include "fileindex/status_mgr.h"
 #include "sdk/platform.h"
+#include "sdk/share.h"
 
 namespace vellis::fileindex::elastic {
 namespace {
@@ -138,6 +140,17 @@ void SendRequestDiscardResult(const Json::Value& req) {
 
 std::string GetFileIndexID(const std::string& share) { return "fileindex_" + share; }
 
+void ShareIndexCreate(const std::string& share) {
+  // An unknown share fails here, before anything is sent.
+  const std::string db_path = sdk::SDKShare(share).GetDBPath();
+  Json::Value data = IndexData(share);
+  data["path"] = db_path;
+  data["settings"] = GetFileIndexSettings();
+  data["mappings"] = GetFileIndexMappings();
+  data["event_handler"] = GetFileIndexEventHandler();
+  SendRequestDiscardResult(MakeRequest("index_create", std::move(data)));
+}
+
 void ShareIndexDelete(const std::string& share) {
   SendRequestDiscardResult(MakeRequest("index_delete", IndexData(share)));
 }
@@ -242,6 +255,18 @@ void IndexRename(const std::string& share, const std::string& new_path,
   Json::Value req(Json::objectValue);
   req["compound"] = std::move(compound);
   SendRequestDiscardResult(req);
+}
+
+void IndexCommit(const std::string& share) {
+  try {
+    SendRequestDiscardResult(MakeRequest("commit", IndexData(share)));
+    return;
+  } catch (const Error&) {
+    if (sdk::SDKShare(share).IsSpaceEnough()) throw;
+  }
+  // A commit that failed for lack of space leaves the index incomplete.
+  StatusMgr().SetShareStatus(share, kShareStatusNeedReindex);
+  throw Error(kErrSpaceNotEnough, "Share (" + share + ") space not enough");
 }
 
 void UpdateTermSuggestion(const std::string& db_name, const std::vector<std::string>& doc_ids) {
