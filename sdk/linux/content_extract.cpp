@@ -90,9 +90,9 @@ void FillFileSystemFields(const std::string& path, const FileFacts& facts, Json:
   d[fe::kQORUMDExtension] = GetFileExtension(path, false);
   d[fe::kQORUMDKind] = GetFileExtension(path, true);
   d[fe::kQORUMDIsDir] = S_ISDIR(facts.mode);
-  d[fe::kQORUMDFSSize] = static_cast<Json::UInt64>(facts.size);
-  d[fe::kQORUMDLogicalSize] = static_cast<Json::UInt64>(facts.size);
-  d[fe::kQORUMDPhysicalSize] = static_cast<Json::UInt64>(facts.blocks * 512);
+  d[fe::kQORUMDFSSize] = static_cast<Json::Int64>(facts.size);
+  d[fe::kQORUMDLogicalSize] = static_cast<Json::Int64>(facts.size);
+  d[fe::kQORUMDPhysicalSize] = static_cast<Json::Int64>(facts.blocks * 512);
   d[fe::kQORUMDFSContentChangeDate] = static_cast<Json::Int64>(facts.mtime);
   d[fe::kQORUMDAttributeChangeDate] = static_cast<Json::Int64>(facts.ctime);
   if (facts.has_btime) {
