@@ -105,13 +105,11 @@ std::string SendCommandToDaemon(const std::string& type, const Json::Value& data
   errno = 0;
 
   timeval timeout = ToTimeval(g_send_timeout_ms.load());
-  VELLIS_THROW_IF(
-      0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof(timeout)),
-      kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
+  VELLIS_THROW_IF(0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof(timeout)),
+                  kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
   timeout = ToTimeval(g_recv_timeout_ms.load());
-  VELLIS_THROW_IF(
-      0 > setsockopt(fd_socket, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof(timeout)),
-      kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
+  VELLIS_THROW_IF(0 > setsockopt(fd_socket, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof(timeout)),
+                  kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
 
   Json::Value command(Json::objectValue);
   command["type"] = type;
@@ -120,7 +118,8 @@ std::string SendCommandToDaemon(const std::string& type, const Json::Value& data
   VELLIS_THROW_IF(text.size() > sdk::kMaxMessageSize, kErrInternal,
                   "command too long, size=" + std::to_string(text.size()));
   const std::string header = sdk::EncodeFrameHeader(static_cast<uint32_t>(text.size()));
-  BufferWrite(fd_socket, sdk::kFrameHeaderSize, reinterpret_cast<const unsigned char*>(header.data()));
+  BufferWrite(fd_socket, sdk::kFrameHeaderSize,
+              reinterpret_cast<const unsigned char*>(header.data()));
   BufferWrite(fd_socket, static_cast<unsigned int>(text.size()),
               reinterpret_cast<const unsigned char*>(text.data()));
 

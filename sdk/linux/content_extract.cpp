@@ -107,9 +107,10 @@ void FillFileSystemFields(const std::string& path, const FileFacts& facts, Json:
 }
 
 bool IsPlainTextExtension(const std::string& lower_extension) {
-  static const char* const kTextExtensions[] = {
-      "txt", "text", "log", "md", "csv", "tsv", "json", "xml", "htm", "html", "ini", "conf", "cfg",
-      "yaml", "yml", "c", "h", "cc", "cpp", "hpp", "py", "sh", "java", "js", "css", "srt", "tex"};
+  static const char* const kTextExtensions[] = {"txt", "text", "log",  "md",  "csv",  "tsv", "json",
+                                                "xml", "htm",  "html", "ini", "conf", "cfg", "yaml",
+                                                "yml", "c",    "h",    "cc",  "cpp",  "hpp", "py",
+                                                "sh",  "java", "js",   "css", "srt",  "tex"};
   for (const char* ext : kTextExtensions) {
     if (lower_extension == ext) return true;
   }
@@ -143,8 +144,8 @@ int ExtractDocument(const std::string& path, const Json::Value& options, Json::V
   }
   Json::Value out(Json::objectValue);
   FillFileSystemFields(path, facts, &out);
-  const bool need_meta = options.isObject() && options[fe::kCENeedMeta].isBool() &&
-                         options[fe::kCENeedMeta].asBool();
+  const bool need_meta =
+      options.isObject() && options[fe::kCENeedMeta].isBool() && options[fe::kCENeedMeta].asBool();
   std::string text;
   if (need_meta && S_ISREG(facts.mode) && IsPlainTextExtension(GetFileExtension(path, true)) &&
       ReadText(path, facts, &text)) {

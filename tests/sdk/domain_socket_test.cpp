@@ -90,7 +90,6 @@ TEST_F(SockConnectionTest, SilentPeerTimesOut) {
   std::string message;
   EXPECT_FALSE(conn_->Recv(message));
   EXPECT_EQ(platform_.LogsContaining("receive timed out after 100 ms, 0 of 4 bytes").size(), 1u);
-
 }
 
 TEST_F(SockConnectionTest, PeerThatNeverReadsTimesOutTheSend) {

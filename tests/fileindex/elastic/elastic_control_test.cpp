@@ -152,17 +152,18 @@ TEST_F(ElasticControlTest, IndexLifecycleRequests) {
 
 TEST_F(ElasticControlTest, UpsertAndAttrSendTheExtractedDocument) {
   std::vector<Json::Value> options_seen;
-  platform_.SetParseFile([&](const std::string& path, const Json::Value& options, Json::Value* doc) {
-    options_seen.push_back(options);
-    (*doc)["QORUMDPath"] = path;
-    (*doc)["QORUMDFSName"] = "a.txt";
-    return 0;
-  });
+  platform_.SetParseFile(
+      [&](const std::string& path, const Json::Value& options, Json::Value* doc) {
+        options_seen.push_back(options);
+        (*doc)["QORUMDPath"] = path;
+        (*doc)["QORUMDFSName"] = "a.txt";
+        return 0;
+      });
   IndexUpsert("s", "/v/s/a.txt", true);
   IndexUpsert("s", "/v/s/a.txt", false);
   IndexAttr("s", "/v/s/a.txt");
-  const Json::Value doc = Parse(
-      R"({"QORUMDPath":"/v/s/a.txt","QORUMDFSName":"a.txt","QORUMDSearchFileName":"a.txt"})");
+  const Json::Value doc =
+      Parse(R"({"QORUMDPath":"/v/s/a.txt","QORUMDFSName":"a.txt","QORUMDSearchFileName":"a.txt"})");
   auto sent = daemon_.Requests();
   ASSERT_EQ(sent.size(), 3u);
   const char* commands[] = {"document_upsert_by_id", "document_upsert_by_id", "document_set_by_id"};
@@ -172,7 +173,8 @@ TEST_F(ElasticControlTest, UpsertAndAttrSendTheExtractedDocument) {
     EXPECT_EQ(sent[i]["data"]["id"], "fileindex_s") << i;
     EXPECT_EQ(sent[i]["data"]["doc_id"], "/v/s/a.txt") << i;
     EXPECT_EQ(sent[i]["data"]["data"], doc) << i;
-    EXPECT_EQ(options_seen[i], Parse(need_meta[i] ? R"({"need_meta":true})" : R"({"need_meta":false})"));
+    EXPECT_EQ(options_seen[i],
+              Parse(need_meta[i] ? R"({"need_meta":true})" : R"({"need_meta":false})"));
   }
 }
 
@@ -266,8 +268,8 @@ TEST_F(ElasticControlTest, RenamingAFileSendsAnEmptyCompoundAndSkipsStrayAnswers
 }
 
 TEST_F(ElasticControlTest, PrefixListingAppendsAndRefusesAnswersWithoutData) {
-  daemon_.Push(FakeSearchDaemon::Success(
-      Parse(R"([{"QORUMDPath":"/v/s/d/1"},{"other":1},{"QORUMDPath":7},{"QORUMDPath":"/v/s/d/2"}])")));
+  daemon_.Push(FakeSearchDaemon::Success(Parse(
+      R"([{"QORUMDPath":"/v/s/d/1"},{"other":1},{"QORUMDPath":7},{"QORUMDPath":"/v/s/d/2"}])")));
   std::vector<std::string> paths = {"kept"};
   IndexGetByPrefixPath("s", "/v/s/d", paths);
   EXPECT_EQ(paths, (std::vector<std::string>{"kept", "/v/s/d/1", "/v/s/d/2"}));
