@@ -95,6 +95,8 @@ TEST_F(SendRequestImplTest, RefusesBadAnswersWithAClearError) {
     std::string reason;
   } cases[] = {
       {FakeSearchDaemon::Raw("not json"), 913, "Recv failed, res=not json"},
+      {FakeSearchDaemon::Raw(std::string(10000, 'x')), 913,
+       "Recv failed, res=" + std::string(4096, 'x') + "...(10000 bytes)"},
       {FakeSearchDaemon::Raw(R"({"data":1})"), 913, R"(Recv failed, res={"data":1})"},
       {FakeSearchDaemon::Raw(R"({"success":"yes"})"), 913, R"(Recv failed, res={"success":"yes"})"},
       {FakeSearchDaemon::Raw("[true]"), 913, "Recv failed, res=[true]"},
