@@ -88,6 +88,14 @@ std::string SendCommandToDaemon(const std::string& type, const Json::Value& data
   VELLIS_THROW_IF(0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)), kErrInternal,
                   "socket failed, reason=" + ErrnoText(errno));
   ScopedFd closer(fd_socket);
+  // Set before connecting: on a Unix socket the send time-out also bounds a
+  // connect to a daemon whose accept queue is full.
+  timeval timeout = ToTimeval(g_send_timeout_ms.load());
+  VELLIS_THROW_IF(0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof(timeout)),
+                  kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
+  timeout = ToTimeval(g_recv_timeout_ms.load());
+  VELLIS_THROW_IF(0 > setsockopt(fd_socket, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof(timeout)),
+                  kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
 
   const std::string path = RootPath(kFileIndexDaemonSocketPath);
   sockaddr_un addr;
@@ -103,13 +111,6 @@ std::string SendCommandToDaemon(const std::string& type, const Json::Value& data
     sdk::GetPlatform()->Sleep(1);
   }
   errno = 0;
-
-  timeval timeout = ToTimeval(g_send_timeout_ms.load());
-  VELLIS_THROW_IF(0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof(timeout)),
-                  kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
-  timeout = ToTimeval(g_recv_timeout_ms.load());
-  VELLIS_THROW_IF(0 > setsockopt(fd_socket, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof(timeout)),
-                  kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
 
   Json::Value command(Json::objectValue);
   command["type"] = type;

@@ -2,8 +2,10 @@
 
 #include <gtest/gtest.h>
 #include <sys/socket.h>
+#include <sys/un.h>
 #include <unistd.h>
 
+#include <cstring>
 #include <memory>
 #include <thread>
 
@@ -133,6 +135,30 @@ TEST(DomainSockConnectionTest, ConnectsOnlyWhereADaemonListens) {
   EXPECT_EQ(conn.fd(), -1);
   ASSERT_EQ(daemon.RawRequests().size(), 1u);
   EXPECT_EQ(daemon.RawRequests()[0], "{\"question\":1}");
+}
+
+TEST(DomainSockConnectionTest, DaemonThatNeverAcceptsIsNotWaitedForForever) {
+  testing::FakePlatform platform;
+  ScopedPlatform scoped(&platform);
+  testing::TempRoot root;
+  const std::string path = root.Path("/var/run/stuck.sock");
+  sockaddr_un addr{};
+  addr.sun_family = AF_UNIX;
+  memcpy(addr.sun_path, path.c_str(), path.size() + 1);
+  int listener = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  ASSERT_EQ(bind(listener, reinterpret_cast<sockaddr*>(&addr), sizeof(addr)), 0);
+  ASSERT_EQ(listen(listener, 0), 0);
+  // The accept queue fills up; the next connect would block for good.
+  std::vector<std::unique_ptr<DomainSockConnection>> conns;
+  bool refused = false;
+  for (int i = 0; i < 8 && !refused; ++i) {
+    conns.push_back(std::make_unique<DomainSockConnection>(path));
+    conns.back()->SetTimeouts(50, 50);
+    refused = !conns.back()->Connect();
+  }
+  EXPECT_TRUE(refused) << "connect never gave up";
+  EXPECT_EQ(errno, EAGAIN);
+  close(listener);
 }
 
 }  // namespace
