@@ -118,12 +118,6 @@ TEST_F(ElasticControlTest, CompoundWithBusySubRequestIsRetriedWholeAndLoggedSafe
   EXPECT_NE(platform_.LogsContaining("Command: compound[0], db: ").size(), 0u);
 }
 
-TEST_F(ElasticControlTest, IndexIdentifierIsThePrefixAndTheNameUnchanged) {
-  for (const std::string share : {"music", "my music", "m\xC3\xBAsica", "", "a/b"}) {
-    EXPECT_EQ(GetFileIndexID(share), "fileindex_" + share);
-  }
-}
-
 TEST_F(ElasticControlTest, IndexLifecycleRequests) {
   struct Case {
     std::function<void()> call;
