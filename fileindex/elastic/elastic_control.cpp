@@ -116,7 +116,7 @@ void SendRequestRetryOnBusy(Json::Value& res, const Json::Value& req) {
       notified = true;
     }
     sdk::Platform* platform = sdk::GetPlatform();
-    platform->Sleep(static_cast<unsigned>(platform->Rand() % 5) * 60 + 900);
+    platform->Sleep(static_cast<unsigned>(platform->Rand()) % 5 * 60 + 900);
   }
 }
 
