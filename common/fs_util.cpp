@@ -85,6 +85,19 @@ std::string GetFileExtension(const std::string& path, bool lower) {
   return ext;
 }
 
+bool MakeDirs(const std::string& path, unsigned int mode) {
+  const int saved = errno;  // EEXIST on the way is expected, not news
+  for (size_t pos = 1; pos <= path.size(); ++pos) {
+    if (pos == path.size() || path[pos] == '/') mkdir(path.substr(0, pos).c_str(), mode);
+  }
+  struct stat st;
+  if (stat(path.c_str(), &st) == 0 && S_ISDIR(st.st_mode)) {
+    errno = saved;
+    return true;
+  }
+  return false;
+}
+
 std::string RealPath(const std::string& path) {
   char buf[PATH_MAX];
   if (realpath(path.c_str(), buf) == nullptr) return std::string();

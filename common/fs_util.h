@@ -44,6 +44,10 @@ std::string Dirname(const std::string& path);
 // goes through tolower.
 std::string GetFileExtension(const std::string& path, bool lower);
 
+// mkdir -p: creates `path` and its missing parents with `mode` (before
+// umask). True when the folder exists afterwards.
+bool MakeDirs(const std::string& path, unsigned int mode = 0755);
+
 // realpath(3) of `path`; empty on failure.
 std::string RealPath(const std::string& path);
 

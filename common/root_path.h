@@ -15,4 +15,10 @@ inline constexpr char kRootEnv[] = "VELLIS_ROOT";
 // every call.
 std::string RootPath(const std::string& fixed_path);
 
+// Under a root other than "/", creates the folders that the fixed paths live
+// in (tmp, var/run, the package's etc and var folders), so that a fresh root
+// works like a real system. Does nothing under "/". Programs call it once at
+// start; failures show up later where a file cannot be made.
+void PrepareRoot();
+
 }  // namespace vellis

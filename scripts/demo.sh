@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
-# The main job: sets up and builds, then, under a temporary root, generates a
-# sample queue of file-change events and folds it with `vellis queue fold`,
-# rotates a live queue and asks what is pending.
+# The main job: sets up and builds, then, under a temporary root, registers a
+# share, asks which of its paths may be indexed, generates a sample queue of
+# file-change events in the share's queue and folds it with `vellis queue
+# fold`, rotates the queue and asks what is pending.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/setup.sh build
@@ -10,8 +11,24 @@ VELLIS=build/tools/vellis/vellis
 export VELLIS_ROOT="$(mktemp -d /tmp/vellis-demo-XXXXXX)"
 trap 'rm -rf "$VELLIS_ROOT"' EXIT
 share="$VELLIS_ROOT/volume1/photo"
-queue="$VELLIS_ROOT/volume1/@fileindex/photo.queue"
-mkdir -p "$share" "$(dirname "$queue")"
+# A share's index data lives on its own volume: <volume>/@fileindex/<share>/.
+queue="$VELLIS_ROOT/volume1/@fileindex/photo/queue"
+mkdir -p "$share/2019" "$share/albums" "$share/#recycle" "$(dirname "$queue")"
+echo hello > "$share/2019/a.jpg"
+echo deleted > "$share/#recycle/x.jpg"
+ln -s /etc "$share/etc-link"
+
+echo "== vellis share add / list"
+"$VELLIS" share add photo "$share" --recycle-bin
+"$VELLIS" share list
+echo "== vellis path check: which paths may be indexed"
+for p in "$share/2019" "$share/2019/" "$share/etc-link" "$share/#recycle/x.jpg"; do
+  printf '%s: ' "${p#$VELLIS_ROOT}"
+  "$VELLIS" path check "$p" || true
+done
+echo "== vellis path type / share"
+"$VELLIS" path type "$share/2019/a.jpg"
+"$VELLIS" path share "$share/2019/a.jpg"
 
 cat > "$queue" <<QUEUE
 {"event":64,"path":"$share/2019/a.jpg"}

@@ -44,13 +44,6 @@ bool ReadBool(const Json::Value& entry, const char* key) {
 
 std::string RegistryFile() { return RootPath(kShareRegistryPath); }
 
-// mkdir -p; failures show up when the file is written.
-void MakeParentDirs(const std::string& dir) {
-  for (size_t pos = 1; pos <= dir.size(); ++pos) {
-    if (pos == dir.size() || dir[pos] == '/') mkdir(dir.substr(0, pos).c_str(), 0755);
-  }
-}
-
 // The last registry read, kept while the file is the same one: readers such
 // as the indexability rules ask several questions per path.
 struct Cache {
@@ -77,7 +70,7 @@ void LoadForUpdate(std::vector<ShareInfo>* shares) {
 
 void Save(const std::vector<ShareInfo>& shares) {
   std::string file = RegistryFile();
-  MakeParentDirs(Dirname(file));
+  MakeDirs(Dirname(file));
   VELLIS_THROW_IF(!JsonToFile(ShareRegistryToJson(shares), file), kErrSaveJson,
                   "share registry cannot be written, path=" + file + ", reason=" + strerror(errno));
 }
@@ -232,6 +225,7 @@ void RegisterShare(const ShareInfo& share) {
   VELLIS_THROW_IF(RealPath(share.szPath) != share.szPath, kErrBadArgument,
                   "share path leads through a symbolic link: " + share.szPath);
 
+  MakeDirs(Dirname(RootPath(kShareRegistryLockPath)));  // a fresh root has no /tmp
   LockFile lock(RootPath(kShareRegistryLockPath), true);
   std::vector<ShareInfo> shares;
   LoadForUpdate(&shares);
@@ -242,6 +236,7 @@ void RegisterShare(const ShareInfo& share) {
 }
 
 void UnregisterShare(const std::string& name) {
+  MakeDirs(Dirname(RootPath(kShareRegistryLockPath)));  // a fresh root has no /tmp
   LockFile lock(RootPath(kShareRegistryLockPath), true);
   std::vector<ShareInfo> shares;
   LoadForUpdate(&shares);

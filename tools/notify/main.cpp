@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+#include "common/root_path.h"
 #include "sdk/platform.h"
 #include "tools/notify/notification.h"
 
@@ -23,6 +24,7 @@ int main(int argc, char** argv) {
                  "[PARAM...]\n";
     return 2;
   }
+  vellis::PrepareRoot();
   openlog("vellis-notify", LOG_PID, LOG_USER);
   vellis::sdk::Platform* platform = vellis::sdk::GetPlatform();
   std::string line = vellis::notify::NotificationLine(n, platform->Time());

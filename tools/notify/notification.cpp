@@ -63,9 +63,7 @@ std::string NotificationLine(const Notification& n, int64_t time) {
 bool AppendNotification(const std::string& line) {
   std::string path = RootPath(kNotificationsPath);
   std::string dir = Dirname(path);
-  for (size_t pos = 1; pos <= dir.size(); ++pos) {
-    if (pos == dir.size() || dir[pos] == '/') mkdir(dir.substr(0, pos).c_str(), 0755);
-  }
+  MakeDirs(dir);  // a failure shows in the open below
   int fd = open(path.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0644);
   if (fd < 0) return false;
   // One write of the whole line: appends of concurrent notifiers do not

@@ -4,6 +4,7 @@
 #include <iostream>
 
 #include "common/error.h"
+#include "common/root_path.h"
 #include "tools/vellis/commands.h"
 
 int main(int argc, char** argv) {
@@ -23,6 +24,7 @@ int main(int argc, char** argv) {
     return app.exit(e);
   }
 
+  vellis::PrepareRoot();
   openlog("vellis", LOG_PID | (verbose ? LOG_PERROR : 0), LOG_USER);
   try {
     if (ctx.action) ctx.action();
