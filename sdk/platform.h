@@ -13,8 +13,10 @@
 // SetPlatform itself must not race with calls through the old instance.
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 #include <string>
+#include <vector>
 
 namespace vellis::sdk {
 
@@ -30,6 +32,32 @@ struct UserInfo {
   uint32_t uid = 0;
   uint32_t gid = 0;
   std::string home;
+};
+
+// A shared folder's record, as QORUShareGet hands it out. szName and szPath
+// keep the platform record's own field names, which log texts quote.
+struct ShareInfo {
+  std::string szName;            // the share's name ("photo")
+  std::string szPath;            // its full path, ending in the name ("/volume1/photo")
+  int ftp_privilege = 0;         // the FTP privilege word, passed on unchanged
+  bool read_only = false;        // files may not be changed through the share
+  bool encryption = false;       // the share's data is encrypted
+  bool recycle_bin = false;      // deleted files go to "#recycle" at its top
+  bool hide_unreadable = false;  // listings hide what a user may not read
+};
+
+// What QORUShareUserPrivGet grants a user in a share.
+enum SharePriv : int {
+  kSharePrivNoAccess = 0,
+  kSharePrivReadOnly = 1,
+  kSharePrivReadWrite = 2,
+};
+
+// Error numbers that QLIBCErrGet reports besides errno values (which are all
+// below 4096).
+enum PlatformErr : int {
+  kPlatformErrNoSpace = 0x2900,   // 10496: too little free space on the volume
+  kPlatformErrNoInodes = 0x2400,  // 9216: no free file slots (inodes) on the volume
 };
 
 // Permission bits reported by QORUACLPermGet.
@@ -52,6 +80,61 @@ class Platform {
   virtual int Rand() = 0;
   // One line to the system log at `priority` (LOG_ERR, LOG_DEBUG, ...).
   virtual void Syslog(int priority, const std::string& message) = 0;
+
+  // --- Errors ---
+  // The error of the calling thread's last failed platform call: an errno
+  // value or a PlatformErr; 0 when none failed yet.
+  virtual int QLIBCErrGet() = 0;
+
+  // --- Shares ---
+  // The record of the share named `name` (exact bytes) into *out. 0 on
+  // success, negative when there is no such share.
+  virtual int QORUShareGet(const std::string& name, ShareInfo* out) = 0;
+  // The names of all shares into *names. 0 on success, negative on failure.
+  virtual int QLIBShareEnum(std::vector<std::string>* names) = 0;
+  // Each of these sets *value to 1 or 0 and returns 0, or returns negative.
+  // Encrypted: the share uses encryption and is locked (its data is not
+  // reachable). Encryption: the share uses encryption, locked or not.
+  virtual int QLIBShareIsEncryptedGet(const ShareInfo& share, int* value) = 0;
+  virtual int QLIBShareIsReadOnlyGet(const ShareInfo& share, int* value) = 0;
+  virtual int QLIBShareIsEncryptionGet(const ShareInfo& share, int* value) = 0;
+  virtual int QLIBShareRecycleStatusGet(const ShareInfo& share, int* value) = 0;
+  virtual int QLIBShareHideUnreadableGet(const ShareInfo& share, int* value) = 0;
+  // What `user` may do in `share` (SharePriv); negative for an unknown user.
+  virtual int QORUShareUserPrivGet(const std::string& user, const ShareInfo& share) = 0;
+  // The share that holds `full_path` (at or below its path, by whole
+  // components): its name into `name` and its path into `path`, each
+  // NUL-terminated within its size. 0 on success; negative when no share
+  // holds the path or a result does not fit.
+  virtual int QORUShareNamePathGet(const std::string& full_path, char* name, size_t name_size,
+                                   char* path, size_t path_size) = 0;
+  // 1 when the file system of `path` has `bytes` free for user `uid`; 0 when
+  // not or when it cannot be told, with QLIBCErrGet saying which
+  // (kPlatformErrNoSpace, kPlatformErrNoInodes, or an errno value). `flags`
+  // is the platform's; 0.
+  virtual int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes,
+                                int flags) = 0;
+  // The queue file and the index database folder of the share at
+  // `share_path`, and the index name of the share named `share_name`, into
+  // `buf`, NUL-terminated. The same input always gives the same result.
+  // Return the length written; negative when it does not fit in `size`
+  // bytes or the input is unusable.
+  virtual int FILEIDXQueuePathCompose(const std::string& share_path, char* buf, size_t size) = 0;
+  virtual int FILEIDXDBPathCompose(const std::string& share_path, char* buf, size_t size) = 0;
+  virtual int FILEIDXGetIndexID(const std::string& share_name, char* buf, size_t size) = 0;
+
+  // --- Users and credentials ---
+  // Looks a user up by id. 0 and *out filled on success, negative when there
+  // is no such user.
+  virtual int QORUUserGetByUID(uint32_t uid, UserInfo* out) = 0;
+  // 1 when `user` belongs to the administrators group, 0 when not, negative
+  // when the user or the group is unknown. `flags` is the platform's; 0.
+  virtual int QLIBGroupIsAdminGroupMem(const std::string& user, int flags) = 0;
+  // Makes `user` the effective user, with its primary group as effective
+  // group and its supplementary groups. `flags` is the platform's; 1.
+  // Returns true on success; on failure false, with the ids as before and
+  // QLIBCErrGet saying why.
+  virtual bool ResetCredentialsByName(const std::string& user, int flags) = 0;
 
   // --- File systems ---
   // The effective user's permission bits (AclPerm) on `path` into *perm.
@@ -89,6 +172,60 @@ class PlatformWrapper : public Platform {
   int Rand() override { return target_->Rand(); }
   void Syslog(int priority, const std::string& message) override {
     target_->Syslog(priority, message);
+  }
+
+  int QLIBCErrGet() override { return target_->QLIBCErrGet(); }
+
+  int QORUShareGet(const std::string& name, ShareInfo* out) override {
+    return target_->QORUShareGet(name, out);
+  }
+  int QLIBShareEnum(std::vector<std::string>* names) override {
+    return target_->QLIBShareEnum(names);
+  }
+  int QLIBShareIsEncryptedGet(const ShareInfo& share, int* value) override {
+    return target_->QLIBShareIsEncryptedGet(share, value);
+  }
+  int QLIBShareIsReadOnlyGet(const ShareInfo& share, int* value) override {
+    return target_->QLIBShareIsReadOnlyGet(share, value);
+  }
+  int QLIBShareIsEncryptionGet(const ShareInfo& share, int* value) override {
+    return target_->QLIBShareIsEncryptionGet(share, value);
+  }
+  int QLIBShareRecycleStatusGet(const ShareInfo& share, int* value) override {
+    return target_->QLIBShareRecycleStatusGet(share, value);
+  }
+  int QLIBShareHideUnreadableGet(const ShareInfo& share, int* value) override {
+    return target_->QLIBShareHideUnreadableGet(share, value);
+  }
+  int QORUShareUserPrivGet(const std::string& user, const ShareInfo& share) override {
+    return target_->QORUShareUserPrivGet(user, share);
+  }
+  int QORUShareNamePathGet(const std::string& full_path, char* name, size_t name_size, char* path,
+                           size_t path_size) override {
+    return target_->QORUShareNamePathGet(full_path, name, name_size, path, path_size);
+  }
+  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes,
+                        int flags) override {
+    return target_->QORUQuotaIsEnough(uid, path, bytes, flags);
+  }
+  int FILEIDXQueuePathCompose(const std::string& share_path, char* buf, size_t size) override {
+    return target_->FILEIDXQueuePathCompose(share_path, buf, size);
+  }
+  int FILEIDXDBPathCompose(const std::string& share_path, char* buf, size_t size) override {
+    return target_->FILEIDXDBPathCompose(share_path, buf, size);
+  }
+  int FILEIDXGetIndexID(const std::string& share_name, char* buf, size_t size) override {
+    return target_->FILEIDXGetIndexID(share_name, buf, size);
+  }
+
+  int QORUUserGetByUID(uint32_t uid, UserInfo* out) override {
+    return target_->QORUUserGetByUID(uid, out);
+  }
+  int QLIBGroupIsAdminGroupMem(const std::string& user, int flags) override {
+    return target_->QLIBGroupIsAdminGroupMem(user, flags);
+  }
+  bool ResetCredentialsByName(const std::string& user, int flags) override {
+    return target_->ResetCredentialsByName(user, flags);
   }
   int QORUACLPermGet(const std::string& path, int* perm) override {
     return target_->QORUACLPermGet(path, perm);
