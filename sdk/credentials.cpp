@@ -43,9 +43,7 @@ SDKCredentials::SDKCredentials() : euid_(geteuid()), egid_(getegid()) {
   username_ = user_info->name;
 }
 
-SDKCredentials::SDKCredentials(const std::string& username) : SDKCredentials() {
-  AsUser(username);
-}
+SDKCredentials::SDKCredentials(const std::string& username) : SDKCredentials() { AsUser(username); }
 
 void SDKCredentials::AsUser(const std::string& username) {
   LockMutex lock(SDKMutex());

@@ -60,6 +60,42 @@ enum PlatformErr : int {
   kPlatformErrNoInodes = 0x2400,  // 9216: no free file slots (inodes) on the volume
 };
 
+// The file-system types that QORUGetFSType reports. Remote file systems are
+// 20 to 29 and image file systems 30 to 39; kFsPseudo (12) stands for every
+// file system of the kernel's own making, which is never indexed.
+enum FsType : int {
+  kFsOther = 0,  // a local file system not listed below
+  kFsExt = 1,    // ext2, ext3, ext4
+  kFsBtrfs = 2,
+  kFsXfs = 3,
+  kFsTmpfs = 4,  // a tmpfs or ramfs that is not one of the system's own
+  kFsFat = 5,    // vfat, msdos, exFAT
+  kFsNtfs = 6,
+  kFsZfs = 7,
+  kFsF2fs = 8,
+  kFsOverlay = 9,
+  kFsPseudo = 12,  // proc, sysfs, devtmpfs, cgroup, /run and /dev/shm tmpfs...
+  kFsNfs = 20,
+  kFsCifs = 21,  // CIFS and SMB
+  kFsFuse = 22,  // FUSE: taken as remote, since most FUSE mounts are
+  kFs9p = 23,
+  kFsCeph = 24,
+  kFsAfs = 25,
+  kFsCoda = 26,
+  kFsIso9660 = 30,
+  kFsUdf = 31,
+  kFsSquashfs = 32,
+  kFsCramfs = 33,
+  kFsErofs = 34,
+  kFsRomfs = 35,
+};
+
+// Options of QLIBCExecl (bits; the others are ignored here).
+enum ExecOption : int {
+  kExecStdoutToNull = 0x01,  // the program's standard output goes to /dev/null
+  kExecStderrToNull = 0x02,  // its standard error goes to /dev/null
+};
+
 // Permission bits reported by QORUACLPermGet.
 enum AclPerm : int {
   kAclExecute = 1,
@@ -136,6 +172,21 @@ class Platform {
   // QLIBCErrGet saying why.
   virtual bool ResetCredentialsByName(const std::string& user, int flags) = 0;
 
+  // --- Processes ---
+  // Runs `program` (an absolute path) with `args` (argv[1] onwards) and
+  // waits for it: no shell, standard input from /dev/null, no descriptor of
+  // this process inherited. Programs of the appliance are mapped to this
+  // system's own (see docs/platform.md). Returns the exit status (0 to 255);
+  // negative when it cannot be started or dies of a signal.
+  virtual int QLIBCExec(const std::string& program, const std::vector<std::string>& args) = 0;
+  // The same with `options` (ExecOption bits).
+  virtual int QLIBCExecl(const std::string& program, int options,
+                         const std::vector<std::string>& args) = 0;
+
+  // --- Text ---
+  // Compares UTF-8 texts ignoring case: negative, 0 or positive.
+  virtual int QLIBCUnicodeUTF8StrCaseCmp(const std::string& a, const std::string& b) = 0;
+
   // --- File systems ---
   // The effective user's permission bits (AclPerm) on `path` into *perm.
   // 0 on success, negative when the path cannot be examined.
@@ -145,6 +196,26 @@ class Platform {
   // Copies (or moves, with remove_source) a regular file. 0 on success.
   virtual int QORUFileCopy(const std::string& from, const std::string& to,
                            const CopyArgs& args) = 0;
+  // The FsType of the file system holding `path`; negative when the path
+  // cannot be examined. `flags` is the platform's; 0.
+  virtual int QORUGetFSType(const std::string& path, int flags) = 0;
+  // Non-zero when `type` is a remote / an image file system.
+  virtual int QORUFSIsRemoteFS(int type) = 0;
+  virtual int QORUFSIsImageFS(int type) = 0;
+  // *in_snapshot = 1 when `path` lies in a share's snapshot folder
+  // ("#snapshot" at the share's top), else 0; returns 0, or negative when no
+  // share holds the path.
+  virtual int QLIBFhsPathInSnapshot(const std::string& path, int* in_snapshot) = 0;
+  // 1 when `name` (one path component) is the platform's hidden metadata
+  // folder ("@eaDir"), else 0.
+  virtual int QORUEAIsHiddenDir(const std::string& name) = 0;
+  // 1 when `full_path` is at or below "#recycle" at the top of a share whose
+  // recycle bin is on; 0 when not; negative when no share holds it.
+  virtual int QORUShareIsShareRecycle(const std::string& full_path) = 0;
+  // 1 when `full_path` is at or below "#recycle" at the top of a user's home
+  // folder in the "homes" share; 0 when not; negative when there is no
+  // "homes" share. `flags` is the platform's; 11.
+  virtual int QORURecycleUserHomePathIsExist(const std::string& full_path, int flags) = 0;
 
   // --- Users ---
   // Looks a user up by name. 0 and *out filled on success, negative when
@@ -204,8 +275,7 @@ class PlatformWrapper : public Platform {
                            size_t path_size) override {
     return target_->QORUShareNamePathGet(full_path, name, name_size, path, path_size);
   }
-  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes,
-                        int flags) override {
+  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes, int flags) override {
     return target_->QORUQuotaIsEnough(uid, path, bytes, flags);
   }
   int FILEIDXQueuePathCompose(const std::string& share_path, char* buf, size_t size) override {
@@ -227,6 +297,18 @@ class PlatformWrapper : public Platform {
   bool ResetCredentialsByName(const std::string& user, int flags) override {
     return target_->ResetCredentialsByName(user, flags);
   }
+
+  int QLIBCExec(const std::string& program, const std::vector<std::string>& args) override {
+    return target_->QLIBCExec(program, args);
+  }
+  int QLIBCExecl(const std::string& program, int options,
+                 const std::vector<std::string>& args) override {
+    return target_->QLIBCExecl(program, options, args);
+  }
+
+  int QLIBCUnicodeUTF8StrCaseCmp(const std::string& a, const std::string& b) override {
+    return target_->QLIBCUnicodeUTF8StrCaseCmp(a, b);
+  }
   int QORUACLPermGet(const std::string& path, int* perm) override {
     return target_->QORUACLPermGet(path, perm);
   }
@@ -236,6 +318,23 @@ class PlatformWrapper : public Platform {
   int QORUFileCopy(const std::string& from, const std::string& to,
                    const CopyArgs& args) override {
     return target_->QORUFileCopy(from, to, args);
+  }
+  int QORUGetFSType(const std::string& path, int flags) override {
+    return target_->QORUGetFSType(path, flags);
+  }
+  int QORUFSIsRemoteFS(int type) override { return target_->QORUFSIsRemoteFS(type); }
+  int QORUFSIsImageFS(int type) override { return target_->QORUFSIsImageFS(type); }
+  int QLIBFhsPathInSnapshot(const std::string& path, int* in_snapshot) override {
+    return target_->QLIBFhsPathInSnapshot(path, in_snapshot);
+  }
+  int QORUEAIsHiddenDir(const std::string& name) override {
+    return target_->QORUEAIsHiddenDir(name);
+  }
+  int QORUShareIsShareRecycle(const std::string& full_path) override {
+    return target_->QORUShareIsShareRecycle(full_path);
+  }
+  int QORURecycleUserHomePathIsExist(const std::string& full_path, int flags) override {
+    return target_->QORURecycleUserHomePathIsExist(full_path, flags);
   }
   int QORUUserGet(const std::string& name, UserInfo* out) override {
     return target_->QORUUserGet(name, out);

@@ -123,8 +123,8 @@ std::string SDKShare::GetQueuePath() const {
 std::string SDKShare::GetDBPath() const {
   LockMutex lock(SDKMutex());
   char path[4096] = {0};
-  VELLIS_THROW_IF(0 > FILEIDXDBPathCompose(share_info_->szPath, path, sizeof(path)),
-                  kErrInternal, "FILEIDXDBPathCompose failed, share=" + share_info_->szName);
+  VELLIS_THROW_IF(0 > FILEIDXDBPathCompose(share_info_->szPath, path, sizeof(path)), kErrInternal,
+                  "FILEIDXDBPathCompose failed, share=" + share_info_->szName);
   return path;
 }
 

@@ -39,8 +39,7 @@ int CopyToBuffer(const std::string& value, char* buf, size_t size) {
   return static_cast<int>(value.size());
 }
 
-int LinuxPlatform::FILEIDXQueuePathCompose(const std::string& share_path, char* buf,
-                                           size_t size) {
+int LinuxPlatform::FILEIDXQueuePathCompose(const std::string& share_path, char* buf, size_t size) {
   return CopyToBuffer(ComposeQueuePath(share_path), buf, size);
 }
 

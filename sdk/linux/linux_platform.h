@@ -28,8 +28,7 @@ class LinuxPlatform : public Platform {
   int QORUShareUserPrivGet(const std::string& user, const ShareInfo& share) override;
   int QORUShareNamePathGet(const std::string& full_path, char* name, size_t name_size, char* path,
                            size_t path_size) override;
-  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes,
-                        int flags) override;
+  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes, int flags) override;
   int FILEIDXQueuePathCompose(const std::string& share_path, char* buf, size_t size) override;
   int FILEIDXDBPathCompose(const std::string& share_path, char* buf, size_t size) override;
   int FILEIDXGetIndexID(const std::string& share_name, char* buf, size_t size) override;
@@ -39,10 +38,26 @@ class LinuxPlatform : public Platform {
   int QLIBGroupIsAdminGroupMem(const std::string& user, int flags) override;
   bool ResetCredentialsByName(const std::string& user, int flags) override;
 
+  // --- Processes (process.cpp) ---
+  int QLIBCExec(const std::string& program, const std::vector<std::string>& args) override;
+  int QLIBCExecl(const std::string& program, int options,
+                 const std::vector<std::string>& args) override;
+
+  // --- Text (unicode.cpp) ---
+  int QLIBCUnicodeUTF8StrCaseCmp(const std::string& a, const std::string& b) override;
+
   int QORUACLPermGet(const std::string& path, int* perm) override;
   int QORUFSDirIsMntPoint(const std::string& path) override;
   int QORUFileCopy(const std::string& from, const std::string& to,
                    const CopyArgs& args) override;
+  // (file_systems.cpp, share_folders.cpp)
+  int QORUGetFSType(const std::string& path, int flags) override;
+  int QORUFSIsRemoteFS(int type) override;
+  int QORUFSIsImageFS(int type) override;
+  int QLIBFhsPathInSnapshot(const std::string& path, int* in_snapshot) override;
+  int QORUEAIsHiddenDir(const std::string& name) override;
+  int QORUShareIsShareRecycle(const std::string& full_path) override;
+  int QORURecycleUserHomePathIsExist(const std::string& full_path, int flags) override;
 
   int QORUUserGet(const std::string& name, UserInfo* out) override;
 };

@@ -70,9 +70,9 @@ Cache& RegistryCache() {
 }
 
 void LoadForUpdate(std::vector<ShareInfo>* shares) {
-  VELLIS_THROW_IF(!LoadShareRegistry(shares), kErrLoadJson,
-                  "share registry cannot be read, path=" + RegistryFile() + ", reason=" +
-                      strerror(errno));
+  VELLIS_THROW_IF(
+      !LoadShareRegistry(shares), kErrLoadJson,
+      "share registry cannot be read, path=" + RegistryFile() + ", reason=" + strerror(errno));
 }
 
 void Save(const std::vector<ShareInfo>& shares) {

@@ -99,8 +99,8 @@ int LinuxPlatform::QORUShareUserPrivGet(const std::string& user, const ShareInfo
   return (bits & 02) ? kSharePrivReadWrite : kSharePrivReadOnly;
 }
 
-int LinuxPlatform::QORUShareNamePathGet(const std::string& full_path, char* name,
-                                        size_t name_size, char* path, size_t path_size) {
+int LinuxPlatform::QORUShareNamePathGet(const std::string& full_path, char* name, size_t name_size,
+                                        char* path, size_t path_size) {
   std::vector<ShareInfo> shares;
   if (!LoadShareRegistry(&shares)) return FailWith(errno);
   const ShareInfo* share = FindShareHolding(shares, full_path);

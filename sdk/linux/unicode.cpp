@@ -5,6 +5,8 @@
 
 #include <cstdint>
 
+#include "sdk/linux/linux_platform.h"
+
 namespace vellis::sdk {
 namespace {
 
@@ -21,6 +23,10 @@ int Utf8CaseCompare(const std::string& a, const std::string& b) {
   }
   int c = a.compare(b);
   return c < 0 ? -1 : (c > 0 ? 1 : 0);
+}
+
+int LinuxPlatform::QLIBCUnicodeUTF8StrCaseCmp(const std::string& a, const std::string& b) {
+  return Utf8CaseCompare(a, b);
 }
 
 }  // namespace vellis::sdk

@@ -128,8 +128,8 @@ TEST_P(ShareContractTest, OnlyPlainWritableUnlockedSharesCanBeIndexed) {
 }
 
 TEST_P(ShareContractTest, UnknownShareIsError800) {
-  for (const std::string& name : {std::string("nosuch"), std::string("Photo"), std::string(""),
-                                 std::string("photo\0x", 7)}) {
+  for (const std::string& name :
+       {std::string("nosuch"), std::string("Photo"), std::string(""), std::string("photo\0x", 7)}) {
     try {
       SDKShare share(name);
       ADD_FAILURE() << "opened share \"" << name << "\"";

@@ -122,7 +122,8 @@ TEST_F(ShareTest, ComposedPathsThatDoNotFitTheirBufferFail) {
   deep.szPath = "/volume1/" + std::string(4070, 'd') + "/deep";
   platform_.AddShare(deep);
   SDKShare share("deep");
-  EXPECT_EQ(Thrown([&] { share.GetQueuePath(); }), "502 FILEIDXQueuePathCompose failed, share=deep");
+  EXPECT_EQ(Thrown([&] { share.GetQueuePath(); }),
+            "502 FILEIDXQueuePathCompose failed, share=deep");
   EXPECT_EQ(Thrown([&] { share.GetDBPath(); }), "502 FILEIDXDBPathCompose failed, share=deep");
   EXPECT_EQ(share.GetDBName(), "fileindex_deep");
 }

@@ -3,6 +3,8 @@
 #include <cerrno>
 #include <cstring>
 
+#include "sdk/linux/share_folders.h"
+
 namespace vellis::testing {
 namespace {
 
@@ -160,8 +162,7 @@ int FakeSharePlatform::QLIBShareHideUnreadableGet(const sdk::ShareInfo& share, i
   return 0;
 }
 
-int FakeSharePlatform::QORUShareUserPrivGet(const std::string& user,
-                                            const sdk::ShareInfo& share) {
+int FakeSharePlatform::QORUShareUserPrivGet(const std::string& user, const sdk::ShareInfo& share) {
   if (Fails("QORUShareUserPrivGet", user)) return -1;
   return FakePlatform::QORUShareUserPrivGet(user, share);
 }
@@ -201,8 +202,7 @@ int FakeSharePlatform::FILEIDXQueuePathCompose(const std::string& share_path, ch
   return FakePlatform::FILEIDXQueuePathCompose(share_path, buf, size);
 }
 
-int FakeSharePlatform::FILEIDXDBPathCompose(const std::string& share_path, char* buf,
-                                            size_t size) {
+int FakeSharePlatform::FILEIDXDBPathCompose(const std::string& share_path, char* buf, size_t size) {
   if (Fails("FILEIDXDBPathCompose", share_path)) return -1;
   return FakePlatform::FILEIDXDBPathCompose(share_path, buf, size);
 }
@@ -239,6 +239,111 @@ int FakeSharePlatform::QORUFSDirIsMntPoint(const std::string& path) {
     if (it != mount_points_.end()) return it->second;
   }
   return FakePlatform::QORUFSDirIsMntPoint(path);
+}
+
+}  // namespace vellis::testing
+
+namespace vellis::testing {
+
+void FakeSharePlatform::SetFsType(const std::string& path, int type) {
+  std::lock_guard<std::mutex> lock(share_mu_);
+  fs_types_[path] = type;
+}
+
+void FakeSharePlatform::SetExecResult(int result, bool for_real) {
+  std::lock_guard<std::mutex> lock(share_mu_);
+  exec_result_ = result;
+  exec_for_real_ = for_real;
+}
+
+std::vector<FakeSharePlatform::Exec> FakeSharePlatform::Execs() const {
+  std::lock_guard<std::mutex> lock(share_mu_);
+  return execs_;
+}
+
+bool FakeSharePlatform::HoldingShare(const std::string& full_path, sdk::ShareInfo* out) {
+  std::lock_guard<std::mutex> lock(share_mu_);
+  for (const sdk::ShareInfo& s : shares_) {
+    if (IsInside(full_path, s.szPath)) {
+      *out = s;
+      return true;
+    }
+  }
+  error_ = ENOENT;
+  return false;
+}
+
+int FakeSharePlatform::QORUGetFSType(const std::string& path, int flags) {
+  if (Fails("QORUGetFSType", path)) return -1;
+  {
+    std::lock_guard<std::mutex> lock(share_mu_);
+    const std::pair<const std::string, int>* best = nullptr;
+    for (const auto& entry : fs_types_) {
+      if (IsInside(path, entry.first) && (!best || entry.first.size() > best->first.size())) {
+        best = &entry;
+      }
+    }
+    if (best) return best->second;
+  }
+  return FakePlatform::QORUGetFSType(path, flags);
+}
+
+int FakeSharePlatform::QLIBFhsPathInSnapshot(const std::string& path, int* in_snapshot) {
+  if (Fails("QLIBFhsPathInSnapshot", path)) return -1;
+  sdk::ShareInfo share;
+  if (!HoldingShare(path, &share)) return -1;
+  *in_snapshot = sdk::IsInShareSnapshot(share, path) ? 1 : 0;
+  return 0;
+}
+
+int FakeSharePlatform::QORUEAIsHiddenDir(const std::string& name) {
+  if (Fails("QORUEAIsHiddenDir", name)) return -1;
+  return FakePlatform::QORUEAIsHiddenDir(name);
+}
+
+int FakeSharePlatform::QORUShareIsShareRecycle(const std::string& full_path) {
+  if (Fails("QORUShareIsShareRecycle", full_path)) return -1;
+  sdk::ShareInfo share;
+  if (!HoldingShare(full_path, &share)) return -1;
+  return sdk::IsInShareRecycleBin(share, full_path) ? 1 : 0;
+}
+
+int FakeSharePlatform::QORURecycleUserHomePathIsExist(const std::string& full_path, int flags) {
+  (void)flags;
+  if (Fails("QORURecycleUserHomePathIsExist", full_path)) return -1;
+  std::lock_guard<std::mutex> lock(share_mu_);
+  for (const sdk::ShareInfo& s : shares_) {
+    if (s.szName == sdk::kHomesShareName) return sdk::IsInHomeRecycleBin(s, full_path) ? 1 : 0;
+  }
+  error_ = ENOENT;
+  return -1;
+}
+
+int FakeSharePlatform::QLIBCExec(const std::string& program, const std::vector<std::string>& args) {
+  bool for_real;
+  int result;
+  {
+    std::lock_guard<std::mutex> lock(share_mu_);
+    calls_.push_back("QLIBCExec");
+    execs_.push_back(Exec{program, -1, args});
+    for_real = exec_for_real_;
+    result = exec_result_;
+  }
+  return for_real ? FakePlatform::QLIBCExec(program, args) : result;
+}
+
+int FakeSharePlatform::QLIBCExecl(const std::string& program, int options,
+                                  const std::vector<std::string>& args) {
+  bool for_real;
+  int result;
+  {
+    std::lock_guard<std::mutex> lock(share_mu_);
+    calls_.push_back("QLIBCExecl");
+    execs_.push_back(Exec{program, options, args});
+    for_real = exec_for_real_;
+    result = exec_result_;
+  }
+  return for_real ? FakePlatform::QLIBCExecl(program, options, args) : result;
 }
 
 }  // namespace vellis::testing

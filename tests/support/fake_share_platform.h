@@ -43,6 +43,21 @@ class FakeSharePlatform : public FakePlatform {
   // real platform.
   void SetMountPoint(const std::string& path, int answer);
 
+  // QORUGetFSType answers `type` for `path` and everything below it (the
+  // longest scripted path wins); unscripted paths go to the real platform.
+  void SetFsType(const std::string& path, int type);
+
+  // One run of the process runner.
+  struct Exec {
+    std::string program;
+    int options;  // -1 for QLIBCExec
+    std::vector<std::string> args;
+  };
+  // Runs of QLIBCExec / QLIBCExecl are recorded and answer `result` without
+  // running anything; with `for_real`, they run on the real platform.
+  void SetExecResult(int result, bool for_real = false);
+  std::vector<Exec> Execs() const;
+
   // The names of the platform calls made through this fake, in order (the
   // share, user, quota and file-system queries).
   std::vector<std::string> Calls() const;
@@ -62,8 +77,7 @@ class FakeSharePlatform : public FakePlatform {
   int QORUShareUserPrivGet(const std::string& user, const sdk::ShareInfo& share) override;
   int QORUShareNamePathGet(const std::string& full_path, char* name, size_t name_size, char* path,
                            size_t path_size) override;
-  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes,
-                        int flags) override;
+  int QORUQuotaIsEnough(uint32_t uid, const std::string& path, uint64_t bytes, int flags) override;
   int FILEIDXQueuePathCompose(const std::string& share_path, char* buf, size_t size) override;
   int FILEIDXDBPathCompose(const std::string& share_path, char* buf, size_t size) override;
   int FILEIDXGetIndexID(const std::string& share_name, char* buf, size_t size) override;
@@ -72,11 +86,22 @@ class FakeSharePlatform : public FakePlatform {
   bool ResetCredentialsByName(const std::string& user, int flags) override;
 
   int QORUFSDirIsMntPoint(const std::string& path) override;
+  int QORUGetFSType(const std::string& path, int flags) override;
+  int QLIBFhsPathInSnapshot(const std::string& path, int* in_snapshot) override;
+  int QORUEAIsHiddenDir(const std::string& name) override;
+  int QORUShareIsShareRecycle(const std::string& full_path) override;
+  int QORURecycleUserHomePathIsExist(const std::string& full_path, int flags) override;
+
+  int QLIBCExec(const std::string& program, const std::vector<std::string>& args) override;
+  int QLIBCExecl(const std::string& program, int options,
+                 const std::vector<std::string>& args) override;
 
  protected:
   // Records `call`; true (with the error set) when it is scripted to fail
   // for `arg`.
   bool Fails(const std::string& call, const std::string& arg);
+  // The share holding `full_path` into *out; false (error set) when none.
+  bool HoldingShare(const std::string& full_path, sdk::ShareInfo* out);
   // Sets the error that QLIBCErrGet reports on this fake.
   void SetError(int err);
 
@@ -92,6 +117,10 @@ class FakeSharePlatform : public FakePlatform {
   std::optional<std::pair<bool, int>> quota_;
   std::map<std::string, int> admin_members_;
   std::map<std::string, int> mount_points_;
+  std::map<std::string, int> fs_types_;
+  std::vector<Exec> execs_;
+  int exec_result_ = 0;
+  bool exec_for_real_ = false;
   std::vector<std::string> calls_;
   std::vector<std::string> resets_;
   std::optional<int> error_;  // the fake's own last error, once one is set
