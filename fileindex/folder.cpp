@@ -1,7 +1,7 @@
 #include "fileindex/folder.h"
 
 #include "common/json_util.h"
-#include "fileindex/interim_util.h"
+#include "fileindex/util.h"
 
 namespace vellis::fileindex {
 

@@ -9,22 +9,17 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "common/root_path.h"
-#include "fileindex/interim_util.h"
+#include "fileindex/util.h"
 #include "sdk/credentials.h"
+#include "sdk/platform.h"
 
 namespace vellis::fileindex {
 namespace {
 
-// Negative, 0 or positive as `a` sorts before, with or after `b` ignoring
-// case. Kept in one place so that the platform's comparison can replace it.
+// Negative, 0 or positive as `a` sorts before, with or after `b`, ignoring
+// case as the platform folds it.
 int CaseCompare(const std::string& a, const std::string& b) {
-  size_t n = std::min(a.size(), b.size());
-  for (size_t i = 0; i < n; ++i) {
-    int ca = tolower(static_cast<unsigned char>(a[i]));
-    int cb = tolower(static_cast<unsigned char>(b[i]));
-    if (ca != cb) return ca - cb;
-  }
-  return a.size() < b.size() ? -1 : (a.size() > b.size() ? 1 : 0);
+  return sdk::GetPlatform()->QLIBCUnicodeUTF8StrCaseCmp(a, b);
 }
 
 using FolderLess = std::function<bool(const std::shared_ptr<Folder>&,

@@ -2,7 +2,7 @@
 #include <algorithm>
 
 #include "fileindex/folder_mgr.h"
-#include "fileindex/interim_util.h"
+#include "fileindex/util.h"
 
 namespace vellis::fileindex {
 namespace {
