@@ -96,6 +96,12 @@ class FolderMgr {
   // earlier one in the list between equal full paths); null when none.
   std::shared_ptr<Folder> GetMostSuitableCfg(const std::string& full_path) const;
 
+  // Whether the content of the file at `full_path` is indexed: false when
+  // no entry governs it; otherwise the governing entry's flag for the file's
+  // type (document, audio, video, photo for images), and true for a type
+  // outside the four categories.
+  bool IsFullPathNeedMeta(const std::string& full_path) const;
+
   // True when some entry's path is in the share `share`.
   bool IsShareIndexed(const std::string& share) const;
 

@@ -47,6 +47,23 @@ std::shared_ptr<Folder> FolderMgr::GetMostSuitableCfg(const std::string& full_pa
   return best;
 }
 
+bool FolderMgr::IsFullPathNeedMeta(const std::string& full_path) const {
+  std::shared_ptr<Folder> cfg = GetMostSuitableCfg(full_path);
+  if (!cfg) return false;
+  switch (GetFileTypeByFullPath(full_path)) {
+    case kDocument:
+      return cfg->IsDocument();
+    case kAudio:
+      return cfg->IsAudio();
+    case kVideo:
+      return cfg->IsVideo();
+    case kImage:
+      return cfg->IsPhoto();
+    default:
+      return true;
+  }
+}
+
 bool FolderMgr::IsShareIndexed(const std::string& share) const {
   return std::any_of(folders_.begin(), folders_.end(), [&share](const std::shared_ptr<Folder>& f) {
     // From the path itself: a record renamed with SetShare keeps its cache.

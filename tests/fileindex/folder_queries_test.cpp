@@ -89,6 +89,30 @@ TEST_F(FolderQueriesTest, SharePathAndShareQueriesCompareWholeNames) {
   EXPECT_EQ(mgr_.GetIndexedShares(), (std::set<std::string>{"music", "photo"}));
 }
 
+TEST_F(FolderQueriesTest, NeedMetaFollowsTheGoverningFoldersFlagForTheFileType) {
+  std::shared_ptr<Folder> changed;
+  mgr_.Upsert(changed, std::make_shared<Folder>("/music/live/docs", "docs", true, false, false,
+                                                false, false, false));
+  mgr_.Upsert(changed, std::make_shared<Folder>("/music/live/media", "media", false, true, true,
+                                                true, false, false));
+  mgr_.Upsert(changed, std::make_shared<Folder>("/music/live/none", "none", false, false, false,
+                                                false, false, false));
+  struct Case {
+    std::string full_path;
+    bool expected;
+  } cases[] = {
+      {"/music/live/docs/a.PDF", true},     {"/music/live/docs/a.mp3", false},
+      {"/music/live/docs/README", true},    {"/music/live/media/a.pdf", false},
+      {"/music/live/media/a.flac", true},   {"/music/live/media/a.mkv", true},
+      {"/music/live/media/a.jpg", true},    {"/music/live/none/a.jpg", false},
+      {"/music/live/none/a.exe", true},  // outside the four categories
+      {"/musicbox/a.exe", false},        // under no folder
+  };
+  for (const Case& c : cases) {
+    EXPECT_EQ(mgr_.IsFullPathNeedMeta(v_ + c.full_path), c.expected) << c.full_path;
+  }
+}
+
 TEST_F(FolderQueriesTest, EarlierOfTwoEntriesWithTheSameFullPathGoverns) {
   // Upsert keeps paths unique, but a file written by hand may repeat one.
   testing::WriteFile(env_.FoldersFile(),
