@@ -18,6 +18,10 @@
 #include <string>
 #include <vector>
 
+namespace Json {
+class Value;
+}  // namespace Json
+
 namespace vellis::sdk {
 
 // Options of FileCopy. Fields not named are off.
@@ -221,6 +225,18 @@ class Platform {
   // Looks a user up by name. 0 and *out filled on success, negative when
   // there is no such user.
   virtual int QORUUserGet(const std::string& name, UserInfo* out) = 0;
+
+  // --- Content extraction ---
+  // Fills *doc (replacing it) with the document of the file or directory at
+  // the full path `path`: an object keyed by the metadata field names of
+  // fileindex/elastic/schema.h (docs/document.md lists which). `options`
+  // member "need_meta" (bool) asks for content metadata as well as the
+  // file-system fields. A symbolic link is described as itself, never
+  // followed. 0 on success, negative when the path cannot be examined
+  // (errno says why). Implementations may also throw; callers treat that as
+  // a failure.
+  virtual int ParseFile(const std::string& path, const Json::Value& options,
+                        Json::Value* doc) = 0;
 };
 
 // The process's platform. Never null: the Linux platform until replaced.
@@ -338,6 +354,9 @@ class PlatformWrapper : public Platform {
   }
   int QORUUserGet(const std::string& name, UserInfo* out) override {
     return target_->QORUUserGet(name, out);
+  }
+  int ParseFile(const std::string& path, const Json::Value& options, Json::Value* doc) override {
+    return target_->ParseFile(path, options, doc);
   }
 
  private:

@@ -60,6 +60,9 @@ class LinuxPlatform : public Platform {
   int QORURecycleUserHomePathIsExist(const std::string& full_path, int flags) override;
 
   int QORUUserGet(const std::string& name, UserInfo* out) override;
+
+  // In sdk/linux/content_extract.cpp.
+  int ParseFile(const std::string& path, const Json::Value& options, Json::Value* doc) override;
 };
 
 }  // namespace vellis::sdk
