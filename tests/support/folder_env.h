@@ -2,6 +2,8 @@
 // configuration, folder status and custom events.
 #pragma once
 
+#include <atomic>
+#include <cstdint>
 #include <string>
 
 #include "tests/support/fake_share_platform.h"
@@ -10,11 +12,17 @@
 namespace vellis::testing {
 
 // FakeSharePlatform whose sleeps really wait (on the real platform), for
-// tests in which several processes contend for a lock file.
+// tests in which several processes contend for a lock file. USleep waits
+// the asked time divided by SetUSleepDivisor (1 unless set), so that many
+// contending processes retry quickly.
 class SleepingSharePlatform : public FakeSharePlatform {
  public:
   void Sleep(unsigned int seconds) override { target()->Sleep(seconds); }
-  void USleep(uint64_t microseconds) override { target()->USleep(microseconds); }
+  void USleep(uint64_t microseconds) override { target()->USleep(microseconds / divisor_); }
+  void SetUSleepDivisor(uint64_t divisor) { divisor_ = divisor; }
+
+ private:
+  std::atomic<uint64_t> divisor_{1};
 };
 
 // Owns a TempRoot and installs a SleepingSharePlatform for its lifetime.
