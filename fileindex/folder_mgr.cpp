@@ -79,6 +79,7 @@ void FolderMgr::Upsert(std::shared_ptr<Folder>& changed, std::shared_ptr<Folder>
                                 }),
                  folders_.end());
   folders_.push_back(folder);
+  ListChanged();
   VELLIS_THROW_IF(folders_.size() > kFileIndexFoldersMax, kErrFolderLimit, "");
 }
 
@@ -92,6 +93,7 @@ void FolderMgr::Delete(std::shared_ptr<Folder>& changed, const std::string& path
                                   return f->GetPath() == path;
                                 }),
                  folders_.end());
+  ListChanged();
   changed = DiffCfg(before, GetMostSuitableCfg(full_path));
 }
 
@@ -101,6 +103,7 @@ void FolderMgr::DeleteByShare(const std::string& share) {
                                   return f->GetShare() == share;
                                 }),
                  folders_.end());
+  ListChanged();
 }
 
 std::shared_ptr<Folder> FolderMgr::DiffCfg(std::shared_ptr<Folder> folder,

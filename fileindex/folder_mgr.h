@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "fileindex/folder.h"
+#include "fileindex/full_path_index.h"
 
 namespace vellis::fileindex {
 
@@ -89,7 +90,9 @@ class FolderMgr {
   // True when `full_path` is itself some entry's full path.
   bool IsFullPathHasOwnCfg(const std::string& full_path) const;
 
-  // True when `full_path` lies under some entry.
+  // True when `full_path` lies under some entry. This and the two below take
+  // a few hash lookups per component of `full_path`, whatever the size of
+  // the list.
   bool IsFullPathIndexed(const std::string& full_path) const;
 
   // The entry that governs `full_path`: the deepest one it lies under (the
@@ -109,7 +112,13 @@ class FolderMgr {
   std::set<std::string> GetIndexedShares() const;
 
  private:
+  // The entries by full path, built on the first path query after a change
+  // of the list (the records' full paths do not change once computed).
+  const FullPathIndex& Index() const;
+  void ListChanged() { index_.reset(); }
+
   std::vector<std::shared_ptr<Folder>> folders_;
+  mutable std::shared_ptr<const FullPathIndex> index_;
 };
 
 }  // namespace vellis::fileindex
