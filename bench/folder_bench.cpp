@@ -17,6 +17,7 @@
 //
 //   build/bench/folder_bench [--benchmark_filter=...]
 #include <benchmark/benchmark.h>
+#include <ftw.h>
 #include <sys/stat.h>
 
 #include <cstdio>
@@ -49,6 +50,7 @@ void MakeDirs(const std::string& path) {
 }
 
 struct Setup {
+  std::string root;
   std::string volume;
   std::vector<std::string> paths;  // full paths to classify
 };
@@ -60,6 +62,7 @@ const Setup& GetSetup() {
     std::string root = std::string(tmp && *tmp ? tmp : "/tmp") + "/vellis-folder-bench-XXXXXX";
     if (mkdtemp(&root[0]) == nullptr) abort();
     setenv(vellis::kRootEnv, root.c_str(), 1);
+    s->root = root;
     MakeDirs(root + "/var/packages/Vellis/etc");
     MakeDirs(root + "/tmp");
     s->volume = root + "/volume1";
@@ -75,10 +78,10 @@ const Setup& GetSetup() {
       for (int a = 0; a < kTopFolders; ++a) {
         std::string top = "/" + share.szName + "/d" + std::to_string(a);
         MakeDirs(s->volume + top + "/sub");
-        mgr.Upsert(changed, std::make_shared<Folder>(top, "top", a % 2 == 0, true, a % 3 == 0,
-                                                     true, false, false));
-        mgr.Upsert(changed, std::make_shared<Folder>(top + "/sub", "sub", true, a % 2 == 1,
-                                                     false, a % 5 == 0, false, false));
+        mgr.Upsert(changed, std::make_shared<Folder>(top, "top", a % 2 == 0, true, a % 3 == 0, true,
+                                                     false, false));
+        mgr.Upsert(changed, std::make_shared<Folder>(top + "/sub", "sub", true, a % 2 == 1, false,
+                                                     a % 5 == 0, false, false));
       }
     }
     mgr.Save();
@@ -89,8 +92,8 @@ const Setup& GetSetup() {
     const char* exts[] = {"pdf", "mp3", "mkv", "jpg", "exe", "txt"};
     s->paths.reserve(kPaths);
     for (size_t i = 0; i < kPaths; ++i) {
-      std::string p = s->volume + "/share" + std::to_string(share(rng)) + "/d" +
-                      std::to_string(dir(rng));
+      std::string p =
+          s->volume + "/share" + std::to_string(share(rng)) + "/d" + std::to_string(dir(rng));
       int d = depth(rng);
       if (d >= 1) p += "/sub";
       if (d == 2) p += "/deeper";
@@ -161,6 +164,22 @@ BENCHMARK(BM_GetMostSuitableCfg)->Unit(benchmark::kMillisecond)->Iterations(3);
 BENCHMARK(BM_IsFullPathNeedMeta)->Unit(benchmark::kMillisecond)->Iterations(3);
 BENCHMARK(BM_StatusPage)->Unit(benchmark::kMillisecond)->Iterations(1);
 
+int RemoveEntry(const char* path, const struct stat*, int, struct FTW*) {
+  remove(path);
+  return 0;
+}
+
 }  // namespace
 
-BENCHMARK_MAIN();
+int main(int argc, char** argv) {
+  benchmark::Initialize(&argc, argv);
+  if (benchmark::ReportUnrecognizedArguments(argc, argv)) return 1;
+  benchmark::RunSpecifiedBenchmarks();
+  benchmark::Shutdown();
+  // The setup is made only when a benchmark ran.
+  const char* root = getenv(vellis::kRootEnv);
+  if (root && std::string(root).find("/vellis-folder-bench-") != std::string::npos) {
+    nftw(root, RemoveEntry, 64, FTW_DEPTH | FTW_PHYS);
+  }
+  return 0;
+}

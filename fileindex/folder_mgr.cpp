@@ -22,8 +22,8 @@ int CaseCompare(const std::string& a, const std::string& b) {
   return sdk::GetPlatform()->QLIBCUnicodeUTF8StrCaseCmp(a, b);
 }
 
-using FolderLess = std::function<bool(const std::shared_ptr<Folder>&,
-                                      const std::shared_ptr<Folder>&)>;
+using FolderLess =
+    std::function<bool(const std::shared_ptr<Folder>&, const std::shared_ptr<Folder>&)>;
 
 // Entries without the flag sort first.
 FolderLess ByFlag(bool (Folder::*flag)() const) {
@@ -73,11 +73,10 @@ void FolderMgr::Save() const {
 void FolderMgr::Upsert(std::shared_ptr<Folder>& changed, std::shared_ptr<Folder> folder) {
   changed = DiffCfg(folder, GetMostSuitableCfg(folder->GetFullPath()));
   const std::string& path = folder->GetPath();
-  folders_.erase(std::remove_if(folders_.begin(), folders_.end(),
-                                [&path](const std::shared_ptr<Folder>& f) {
-                                  return f->GetPath() == path;
-                                }),
-                 folders_.end());
+  folders_.erase(
+      std::remove_if(folders_.begin(), folders_.end(),
+                     [&path](const std::shared_ptr<Folder>& f) { return f->GetPath() == path; }),
+      folders_.end());
   folders_.push_back(folder);
   ListChanged();
   VELLIS_THROW_IF(folders_.size() > kFileIndexFoldersMax, kErrFolderLimit, "");
@@ -88,21 +87,19 @@ void FolderMgr::Delete(std::shared_ptr<Folder>& changed, const std::string& path
   std::shared_ptr<Folder> before = GetMostSuitableCfg(full_path);
   // Without a governing entry there is nothing to diff against.
   VELLIS_THROW_IF(!before, kErrFolderNotFound, path);
-  folders_.erase(std::remove_if(folders_.begin(), folders_.end(),
-                                [&path](const std::shared_ptr<Folder>& f) {
-                                  return f->GetPath() == path;
-                                }),
-                 folders_.end());
+  folders_.erase(
+      std::remove_if(folders_.begin(), folders_.end(),
+                     [&path](const std::shared_ptr<Folder>& f) { return f->GetPath() == path; }),
+      folders_.end());
   ListChanged();
   changed = DiffCfg(before, GetMostSuitableCfg(full_path));
 }
 
 void FolderMgr::DeleteByShare(const std::string& share) {
-  folders_.erase(std::remove_if(folders_.begin(), folders_.end(),
-                                [&share](const std::shared_ptr<Folder>& f) {
-                                  return f->GetShare() == share;
-                                }),
-                 folders_.end());
+  folders_.erase(
+      std::remove_if(folders_.begin(), folders_.end(),
+                     [&share](const std::shared_ptr<Folder>& f) { return f->GetShare() == share; }),
+      folders_.end());
   ListChanged();
 }
 
@@ -112,16 +109,16 @@ std::shared_ptr<Folder> FolderMgr::DiffCfg(std::shared_ptr<Folder> folder,
     return std::make_shared<Folder>(folder->GetPath(), folder->GetName(), true, true, true, true,
                                     false, false);
   }
-  return std::make_shared<Folder>(folder->GetPath(), folder->GetName(),
-                                  folder->IsDocument() != base->IsDocument(),
-                                  folder->IsAudio() != base->IsAudio(),
-                                  folder->IsVideo() != base->IsVideo(),
-                                  folder->IsPhoto() != base->IsPhoto(), false, false);
+  return std::make_shared<Folder>(
+      folder->GetPath(), folder->GetName(), folder->IsDocument() != base->IsDocument(),
+      folder->IsAudio() != base->IsAudio(), folder->IsVideo() != base->IsVideo(),
+      folder->IsPhoto() != base->IsPhoto(), false, false);
 }
 
 void FolderMgr::Get(std::shared_ptr<Folder>& out, const std::string& path) const {
-  auto it = std::find_if(folders_.begin(), folders_.end(),
-                         [&path](const std::shared_ptr<Folder>& f) { return f->GetPath() == path; });
+  auto it =
+      std::find_if(folders_.begin(), folders_.end(),
+                   [&path](const std::shared_ptr<Folder>& f) { return f->GetPath() == path; });
   VELLIS_THROW_IF(it == folders_.end(), kErrFolderNotFound, path);
   out = *it;
 }

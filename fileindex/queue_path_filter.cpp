@@ -10,8 +10,8 @@
 #include <string_view>
 #include <vector>
 
-#include "common/line_reader.h"
 #include "common/json_util.h"
+#include "common/line_reader.h"
 
 namespace vellis::fileindex {
 namespace {
@@ -146,9 +146,8 @@ std::shared_ptr<const FileHashes> Lookup(const FileKey& key) {
   // Built outside the lock: other files stay answerable meanwhile.
   std::shared_ptr<const FileHashes> built = Build(key);
   std::lock_guard<std::mutex> lock(c.mutex);
-  cache->remove_if([&key](const std::shared_ptr<const FileHashes>& f) {
-    return f->key.path == key.path;
-  });
+  cache->remove_if(
+      [&key](const std::shared_ptr<const FileHashes>& f) { return f->key.path == key.path; });
   cache->push_front(built);
   if (cache->size() > kMaxFiles) cache->pop_back();
   return built;

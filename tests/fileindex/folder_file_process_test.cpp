@@ -81,7 +81,8 @@ TEST_F(FolderFileProcessTest, WriterKilledWhileSavingLeavesTheOldOrTheNewList) {
   {
     FolderMgr mgr;
     std::shared_ptr<Folder> changed;
-    for (size_t i = 0; i < kBase; ++i) mgr.Upsert(changed, MakeFolder("/music/d" + std::to_string(i)));
+    for (size_t i = 0; i < kBase; ++i)
+      mgr.Upsert(changed, MakeFolder("/music/d" + std::to_string(i)));
     mgr.Save();
   }
   sdk::Platform* real = env_.platform().target();

@@ -51,7 +51,10 @@ std::string Flags(const Folder& f) {
 
 class FolderMgrTest : public ::testing::Test {
  protected:
-  FolderMgrTest() { env_.AddShare("music"); env_.AddShare("photo"); }
+  FolderMgrTest() {
+    env_.AddShare("music");
+    env_.AddShare("photo");
+  }
 
   // The paths in the folders file, in file order.
   std::vector<std::string> SavedPaths() {
@@ -121,7 +124,8 @@ TEST_F(FolderMgrTest, SaveKeepsOrderAndFieldsAndSetsMode0644) {
 TEST_F(FolderMgrTest, UpsertOfAKnownPathReplacesItAndMovesItToTheEnd) {
   FolderMgr mgr;
   std::shared_ptr<Folder> changed;
-  for (const char* path : {"/music/a", "/music/b", "/music/c"}) mgr.Upsert(changed, MakeFolder(path));
+  for (const char* path : {"/music/a", "/music/b", "/music/c"})
+    mgr.Upsert(changed, MakeFolder(path));
   mgr.Upsert(changed, MakeFolder("/music/a", "renamed", false, true, true, true));
   mgr.Save();
   Json::Value saved;
@@ -272,12 +276,9 @@ TEST_F(FolderListTest, PagesAtAndPastTheEnd) {
     unsigned int limit;
     std::vector<std::string> expected;
   } cases[] = {
-      {2, 1, {"/music/C"}},
-      {3, 50, {"/music/D", "/music/e"}},
-      {4, 1, {"/music/e"}},
-      {5, 1, {}},
-      {7, 3, {}},
-      {0, 0, {}},
+      {2, 1, {"/music/C"}}, {3, 50, {"/music/D", "/music/e"}},
+      {4, 1, {"/music/e"}}, {5, 1, {}},
+      {7, 3, {}},           {0, 0, {}},
   };
   for (const Case& c : cases) {
     EXPECT_EQ(Paths(Page(c.offset, c.limit, "path", "asc")), c.expected)

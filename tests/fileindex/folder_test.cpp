@@ -117,7 +117,7 @@ TEST_F(FolderShareTest, SetShareReplacesTheFirstWholeShareComponent) {
   } cases[] = {
       {"/music/live", "music", "music2", "/music2/live"},
       {"/music", "music", "tunes", "/tunes"},
-      {"/a/x/a", "a", "b", "/b/x/a"},              // the share name appears twice
+      {"/a/x/a", "a", "b", "/b/x/a"},                // the share name appears twice
       {"/music/music", "music", "m2", "/m2/music"},  // and as a folder below it
   };
   for (const Case& c : cases) {

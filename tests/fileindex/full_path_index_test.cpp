@@ -26,14 +26,27 @@ size_t NaiveCovering(const std::vector<std::string>& entries, const std::string&
 }
 
 TEST(FullPathIndexTest, AgreesWithThePlainRuleOnAwkwardPaths) {
-  const std::vector<std::string> entries = {
-      "/v/music", "/v/music/live", "/v/music", "/v/a/", "/v/a", "/v/b//c", "/v/x.y", "/"};
+  const std::vector<std::string> entries = {"/v/music", "/v/music/live", "/v/music", "/v/a/",
+                                            "/v/a",     "/v/b//c",       "/v/x.y",   "/"};
   FullPathIndex index(entries);
-  const char* paths[] = {"/v/music",      "/v/music/",   "/v/music/live/a", "/v/musicbox/c",
-                         "/v/music/liveX", "/v/a/",      "/v/a//x",         "/v/a/x",
-                         "/v/b//c/d",      "/v/b/c",     "/v/x.y",          "/v/x",
-                         "",               "/",          "//",              "v/music",
-                         "/V/music",       "/v/music//"};
+  const char* paths[] = {"/v/music",
+                         "/v/music/",
+                         "/v/music/live/a",
+                         "/v/musicbox/c",
+                         "/v/music/liveX",
+                         "/v/a/",
+                         "/v/a//x",
+                         "/v/a/x",
+                         "/v/b//c/d",
+                         "/v/b/c",
+                         "/v/x.y",
+                         "/v/x",
+                         "",
+                         "/",
+                         "//",
+                         "v/music",
+                         "/V/music",
+                         "/v/music//"};
   for (const char* p : paths) {
     EXPECT_EQ(index.FindCovering(p), NaiveCovering(entries, p)) << "[" << p << "]";
   }
@@ -46,8 +59,8 @@ TEST(FullPathIndexTest, AgreesWithThePlainRuleOnRandomTrees) {
   std::uniform_int_distribution<int> part(0, 3), depth(1, 5);
   auto random_path = [&] {
     std::string p;
-    for (int d = depth(rng); d > 0; --d) p += "/" + std::string(1, "abAb"[part(rng)]) +
-                                              (part(rng) == 0 ? "b" : "");
+    for (int d = depth(rng); d > 0; --d)
+      p += "/" + std::string(1, "abAb"[part(rng)]) + (part(rng) == 0 ? "b" : "");
     return p;
   };
   for (int round = 0; round < 20; ++round) {
