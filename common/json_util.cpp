@@ -202,7 +202,7 @@ void GetJsonValue(T& out, const Json::Value& obj, const std::string& key, bool r
   CheckObject(obj);
   const Json::Value* member = obj.find(key.data(), key.data() + key.size());
   if (required) {
-    CheckRequired(obj, key);
+    if (member == nullptr) CheckRequired(obj, key);
     if (!isJsonType<T>(*member)) throw Error(kErrBadArgument, "Not a string" + AppendData(obj));
     out = asJsonType<T>(*member);
     return;
@@ -214,8 +214,8 @@ template <>
 void GetJsonValue<Json::Value>(Json::Value& out, const Json::Value& obj, const std::string& key,
                                bool required) {
   CheckObject(obj);
-  if (required) CheckRequired(obj, key);
   const Json::Value* member = obj.find(key.data(), key.data() + key.size());
+  if (required && member == nullptr) CheckRequired(obj, key);
   if (member != nullptr) out = *member;
 }
 
@@ -255,7 +255,11 @@ void JsonApplyChanges(Json::Value& target, const Json::Value& changes) {
       if (target.isObject()) target.removeMember(key);
     } else if (it->isObject()) {
       if (!target.isObject()) target = Json::Value(Json::objectValue);
-      JsonApplyChanges(target[key], *it);
+      // Made an object here, not in the recursion: a change set that only
+      // removes keys (or is empty) must still leave an object, not null.
+      Json::Value& sub = target[key];
+      if (!sub.isObject()) sub = Json::Value(Json::objectValue);
+      JsonApplyChanges(sub, *it);
     } else {
       if (!target.isObject()) target = Json::Value(Json::objectValue);
       target[key] = *it;

@@ -86,7 +86,8 @@ LineReader::Status LineReader::Next(std::string_view* line) {
     if (skipping) {
       begin_ = end_;
     } else if (end_ - begin_ >= max_line_) {
-      preview_.assign(buf_.data() + begin_, kTooLongPreview);
+      // Only valid bytes of this line: max_line_ may be below the preview size.
+      preview_.assign(buf_.data() + begin_, std::min(end_ - begin_, kTooLongPreview));
       skipping = true;
       begin_ = end_;
     }
