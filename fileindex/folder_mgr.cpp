@@ -71,6 +71,7 @@ void FolderMgr::Save() const {
 }
 
 void FolderMgr::Upsert(std::shared_ptr<Folder>& changed, std::shared_ptr<Folder> folder) {
+  VELLIS_THROW_IF(!folder, kErrBadArgument, "no folder to upsert");
   changed = DiffCfg(folder, GetMostSuitableCfg(folder->GetFullPath()));
   const std::string& path = folder->GetPath();
   folders_.erase(

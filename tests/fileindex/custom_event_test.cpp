@@ -24,6 +24,7 @@ namespace vellis::fileindex {
 namespace {
 
 using testing::FolderEnv;
+using testing::ParseJson;
 using testing::ReadFile;
 using testing::WriteFile;
 
@@ -32,12 +33,6 @@ std::vector<std::string> Lines(const std::string& text) {
   std::istringstream in(text);
   for (std::string line; std::getline(in, line);) lines.push_back(line);
   return lines;
-}
-
-Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
 }
 
 class CustomEventTest : public ::testing::Test {
@@ -65,8 +60,8 @@ TEST_F(CustomEventTest, RenameIsOneLineWithTheNewPathAsPath) {
   expected["path"] = share_ + "/b";
   expected["path_old"] = share_ + "/a";
   expected["data"] = Json::Value();
-  EXPECT_EQ(Parse(Lines(text)[0]), expected);
-  EXPECT_FALSE(Parse(Lines(text)[0]).isMember("is_dir"));
+  EXPECT_EQ(ParseJson(Lines(text)[0]), expected);
+  EXPECT_FALSE(ParseJson(Lines(text)[0]).isMember("is_dir"));
   Event event(Lines(text)[0]);
   EXPECT_EQ(event.event, 256u);
   EXPECT_EQ(event.path, share_ + "/b");
@@ -76,7 +71,7 @@ TEST_F(CustomEventTest, RenameIsOneLineWithTheNewPathAsPath) {
 TEST_F(CustomEventTest, EventsAreAppendedAfterWhatTheQueueHolds) {
   const std::string monitor_line = R"({"event":2,"path":")" + share_ + R"(/x"})";
   WriteFile(queue_, monitor_line + "\n");
-  Json::Value cfg = Parse(R"({"document":true,"audio":false,"video":false,"photo":true})");
+  Json::Value cfg = ParseJson(R"({"document":true,"audio":false,"video":false,"photo":true})");
   AddCustomEvent(0x20000, share_ + "/dir", "", cfg);
   AddCustomEvent(0x10000, share_ + "/new\nline", "", Json::Value());
   std::vector<std::string> lines = Lines(ReadFile(queue_));

@@ -18,24 +18,10 @@ namespace vellis::fileindex {
 namespace {
 
 using testing::FolderEnv;
+using testing::MakeFolder;
 using testing::ReadFile;
+using testing::Thrown;
 using testing::WriteFile;
-
-std::shared_ptr<Folder> MakeFolder(const std::string& path, const std::string& name = "n",
-                                   bool document = true, bool audio = true, bool video = true,
-                                   bool photo = true) {
-  return std::make_shared<Folder>(path, name, document, audio, video, photo, false, false);
-}
-
-// "<code> <reason>" of the Error that `fn` throws, or "no error".
-std::string Thrown(const std::function<void()>& fn) {
-  try {
-    fn();
-  } catch (const Error& e) {
-    return std::to_string(e.GetCode()) + " " + e.what();
-  }
-  return "no error";
-}
 
 std::vector<std::string> Paths(const std::vector<std::shared_ptr<Folder>>& folders) {
   std::vector<std::string> paths;

@@ -12,6 +12,7 @@ namespace vellis::fileindex {
 namespace {
 
 using testing::FolderEnv;
+using testing::MakeFolder;
 
 class FolderQueriesTest : public ::testing::Test {
  protected:
@@ -26,8 +27,7 @@ class FolderQueriesTest : public ::testing::Test {
 
   void Add(const std::string& path, const std::string& name) {
     std::shared_ptr<Folder> changed;
-    mgr_.Upsert(changed,
-                std::make_shared<Folder>(path, name, true, true, true, true, false, false));
+    mgr_.Upsert(changed, MakeFolder(path, name));
   }
 
   // The governing folder's name, or "none".
@@ -83,12 +83,9 @@ TEST_F(FolderQueriesTest, SharePathAndShareQueriesCompareWholeNames) {
 
 TEST_F(FolderQueriesTest, NeedMetaFollowsTheGoverningFoldersFlagForTheFileType) {
   std::shared_ptr<Folder> changed;
-  mgr_.Upsert(changed, std::make_shared<Folder>("/music/live/docs", "docs", true, false, false,
-                                                false, false, false));
-  mgr_.Upsert(changed, std::make_shared<Folder>("/music/live/media", "media", false, true, true,
-                                                true, false, false));
-  mgr_.Upsert(changed, std::make_shared<Folder>("/music/live/none", "none", false, false, false,
-                                                false, false, false));
+  mgr_.Upsert(changed, MakeFolder("/music/live/docs", "docs", true, false, false, false));
+  mgr_.Upsert(changed, MakeFolder("/music/live/media", "media", false, true, true, true));
+  mgr_.Upsert(changed, MakeFolder("/music/live/none", "none", false, false, false, false));
   struct Case {
     std::string full_path;
     bool expected;
