@@ -19,7 +19,7 @@ namespace {
 // Files remembered at once, and the most hashes one file may hold before it
 // is not filtered at all (8 bytes each).
 constexpr size_t kMaxFiles = 4;
-constexpr size_t kMaxHashes = size_t{4} << 20;
+constexpr size_t kMaxHashes = size_t{2} << 20;
 
 constexpr uint64_t kFnvOffset = 14695981039346656037ull;
 constexpr uint64_t kFnvPrime = 1099511628211ull;

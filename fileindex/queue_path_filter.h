@@ -6,7 +6,9 @@
 // of each of that path's ancestors; a path whose hash is not recorded has no
 // event at or below it. The pass is shared by every query in the process
 // while the file stays the same (same device, inode, size, modification and
-// change times); a few recent files are kept. Thread-safe.
+// change times); the four most recently asked files are kept, each with at
+// most 2^21 distinct hashes (16 MiB): a file with more paths than that is
+// not filtered (every answer is "maybe"). Thread-safe.
 #pragma once
 
 #include <string>
