@@ -8,6 +8,7 @@
 #include <memory>
 #include <mutex>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 #include "common/json_util.h"
@@ -24,16 +25,40 @@ constexpr size_t kMaxHashes = size_t{2} << 20;
 constexpr uint64_t kFnvOffset = 14695981039346656037ull;
 constexpr uint64_t kFnvPrime = 1099511628211ull;
 
-// Adds the FNV-1a hash of `path` and of each prefix of it that ends just
-// before a "/": exactly the full paths that `path` lies at or below.
-void AddPathHashes(std::string_view path, std::vector<uint64_t>* hashes) {
-  uint64_t h = kFnvOffset;
-  for (char c : path) {
-    if (c == '/') hashes->push_back(h);
-    h = (h ^ static_cast<unsigned char>(c)) * kFnvPrime;
+// Collects the hashes of a file's paths.
+class HashCollector {
+ public:
+  explicit HashCollector(std::vector<uint64_t>* hashes) : hashes_(hashes) {}
+
+  // Adds the FNV-1a hash of `path` and of each prefix of it that ends just
+  // before a "/": exactly the full paths that `path` lies at or below.
+  void AddPath(std::string_view path) {
+    uint64_t h = kFnvOffset;
+    size_t depth = 0;
+    for (char c : path) {
+      if (c == '/') Add(h, depth++);
+      h = (h ^ static_cast<unsigned char>(c)) * kFnvPrime;
+    }
+    Add(h, depth);
   }
-  hashes->push_back(h);
-}
+
+ private:
+  static constexpr size_t kMaxDepth = 64;
+
+  // Queued paths come in runs below the same folders: a hash equal to the
+  // last one added at its depth is already collected, and skipping it
+  // spares most of the sorting.
+  void Add(uint64_t h, size_t depth) {
+    if (depth < kMaxDepth) {
+      if (last_[depth].first && last_[depth].second == h) return;
+      last_[depth] = {true, h};
+    }
+    hashes_->push_back(h);
+  }
+
+  std::vector<uint64_t>* hashes_;
+  std::pair<bool, uint64_t> last_[kMaxDepth] = {};
+};
 
 uint64_t PathHash(std::string_view path) {
   uint64_t h = kFnvOffset;
@@ -50,14 +75,14 @@ void Compact(std::vector<uint64_t>* hashes) {
 // event's paths are among the line's quoted texts; taking every quoted text
 // that begins with "/" may record too much, never too little. A line with
 // an escape is parsed.
-void AddLineHashes(std::string_view line, std::vector<uint64_t>* hashes) {
+void AddLineHashes(std::string_view line, HashCollector* hashes) {
   if (line.find('\\') != std::string_view::npos) {
     Json::Value event;
     // A line that is no JSON object is skipped by the search too.
     if (!JsonFromString(event, std::string(line)) || !event.isObject()) return;
     for (const char* key : {"path", "path_old"}) {
       const Json::Value path = event.get(key, Json::Value());
-      if (path.isConvertibleTo(Json::stringValue)) AddPathHashes(path.asString(), hashes);
+      if (path.isConvertibleTo(Json::stringValue)) hashes->AddPath(path.asString());
     }
     return;
   }
@@ -66,7 +91,7 @@ void AddLineHashes(std::string_view line, std::vector<uint64_t>* hashes) {
     size_t close = line.find('"', open + 1);
     if (close == std::string_view::npos) return;
     if (close > open + 1 && line[open + 1] == '/') {
-      AddPathHashes(line.substr(open + 1, close - open - 1), hashes);
+      hashes->AddPath(line.substr(open + 1, close - open - 1));
     }
     open = line.find('"', close + 1);
   }
@@ -100,13 +125,14 @@ std::shared_ptr<const FileHashes> Build(const FileKey& key) {
   file->key = key;
   LineReader reader;
   if (!reader.Open(key.path)) return file;
+  HashCollector collector(&file->hashes);
   std::string_view line;
   for (;;) {
     LineReader::Status status = reader.Next(&line);
     if (status == LineReader::Status::kEnd) break;
     if (status == LineReader::Status::kError) return file;
     if (status == LineReader::Status::kTooLong) continue;  // skipped by the search too
-    AddLineHashes(line, &file->hashes);
+    AddLineHashes(line, &collector);
     if (file->hashes.size() > 2 * kMaxHashes) {
       Compact(&file->hashes);
       if (file->hashes.size() > kMaxHashes) {
