@@ -14,7 +14,6 @@
 #include <vector>
 
 #include "common/json_util.h"
-#include "common/lock_file.h"
 #include "fileindex/optree.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
@@ -61,7 +60,6 @@ TEST_F(CustomEventTest, RenameIsOneLineWithTheNewPathAsPath) {
   expected["path_old"] = share_ + "/a";
   expected["data"] = Json::Value();
   EXPECT_EQ(ParseJson(Lines(text)[0]), expected);
-  EXPECT_FALSE(ParseJson(Lines(text)[0]).isMember("is_dir"));
   Event event(Lines(text)[0]);
   EXPECT_EQ(event.event, 256u);
   EXPECT_EQ(event.path, share_ + "/b");
@@ -102,21 +100,6 @@ TEST_F(CustomEventTest, QueueThatIsNotARegularFileIsNotFollowed) {
   AddCustomEvent(0x10000, share_ + "/a", "", Json::Value());
   EXPECT_EQ(ReadFile(target), "kept\n");
   EXPECT_EQ(env_.platform().LogsContaining("AddCustomEvent failed, code=502").size(), 1u);
-  EXPECT_EQ(ShareStatus("s"), kShareStatusNeedReindex);
-}
-
-TEST_F(CustomEventTest, QueueLockHeldElsewhereFlagsTheShare) {
-  env_.platform().SetRandValues({0});  // retry at once: the budget runs out fast
-  LockFile held(QueueLockPath(queue_), true);
-  pid_t writer = fork();
-  if (writer == 0) {
-    AddCustomEvent(0x10000, share_ + "/a", "", Json::Value());
-    _exit(0);
-  }
-  int status = 0;
-  waitpid(writer, &status, 0);
-  ASSERT_EQ(status, 0);
-  EXPECT_EQ(ReadFile(queue_), "");
   EXPECT_EQ(ShareStatus("s"), kShareStatusNeedReindex);
 }
 
