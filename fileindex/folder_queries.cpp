@@ -7,6 +7,7 @@
 #include "fileindex/util.h"
 
 namespace vellis::fileindex {
+
 const FullPathIndex& FolderMgr::Index() const {
   if (!index_) {
     std::vector<std::string> full_paths;
