@@ -1,8 +1,12 @@
 #include "fileindex/folder_mgr.h"
 
+#include <dirent.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
+#include <cstring>
+#include <ctime>
 #include <functional>
 
 #include "common/fs_util.h"
@@ -47,6 +51,32 @@ FolderLess SortKey(const std::string& sort_by) {
   return ByText(&Folder::GetName);
 }
 
+// A temporary file of a save is renamed moments after it is written, so one
+// that is older than the file just saved by more than this belongs to a save
+// that was killed.
+constexpr time_t kStaleTempSeconds = 60;
+
+// Removes the temporary files that saves killed before their rename left
+// beside the folders file. Failures are harmless and ignored.
+void RemoveStaleTempFiles(const std::string& cfg_path) {
+  struct stat saved;
+  if (stat(cfg_path.c_str(), &saved) != 0) return;
+  const std::string dir = Dirname(cfg_path);
+  const std::string prefix = Basename(cfg_path) + ".tmp-";
+  DIR* entries = opendir(dir.c_str());
+  if (entries == nullptr) return;
+  while (const dirent* entry = readdir(entries)) {
+    if (strncmp(entry->d_name, prefix.c_str(), prefix.size()) != 0) continue;
+    const std::string path = dir + "/" + entry->d_name;
+    struct stat st;
+    if (lstat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode) &&
+        st.st_mtime + kStaleTempSeconds < saved.st_mtime) {
+      unlink(path.c_str());
+    }
+  }
+  closedir(entries);
+}
+
 }  // namespace
 
 FolderMgr::FolderMgr() {
@@ -68,6 +98,7 @@ void FolderMgr::Save() const {
   sdk::SDKCredentials credentials("root");
   VELLIS_THROW_IF(!JsonToFile(folders, cfg_path), kErrSaveJson, cfg_path);
   VELLIS_THROW_IF(-1 == chmod(cfg_path.c_str(), 0644), kErrInternal, cfg_path);
+  RemoveStaleTempFiles(cfg_path);
 }
 
 void FolderMgr::Upsert(std::shared_ptr<Folder>& changed, std::shared_ptr<Folder> folder) {

@@ -35,7 +35,9 @@ class FolderMgr {
 
   // Writes the whole list as root, replacing the file atomically (a crash
   // or a full disk leaves the old list or the new one, never a part), then
-  // sets mode 0644. Throws Error 505 (reason the path) when the file cannot
+  // sets mode 0644 and removes temporary files that saves killed before
+  // their rename left behind (those more than a minute older than the new
+  // file). Throws Error 505 (reason the path) when the file cannot
   // be written, 502 (reason the path) when its mode cannot be set, and the
   // credentials' 503.
   void Save() const;

@@ -1,6 +1,7 @@
 // The folder list and its file: loading, saving, updates, sorting and paging.
 #include "fileindex/folder_mgr.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
@@ -105,6 +106,23 @@ TEST_F(FolderMgrTest, SaveKeepsOrderAndFieldsAndSetsMode0644) {
   struct stat st;
   ASSERT_EQ(stat(env_.FoldersFile().c_str(), &st), 0);
   EXPECT_EQ(st.st_mode & 07777, 0644u);
+}
+
+TEST_F(FolderMgrTest, SaveRemovesOnlyTemporaryFilesOfSavesLongGone) {
+  const std::string stale = env_.FoldersFile() + ".tmp-Ab12Cd";
+  const std::string fresh = env_.FoldersFile() + ".tmp-Ef34Gh";
+  const std::string other = env_.FoldersFile() + ".bak";
+  for (const std::string& f : {stale, fresh, other}) WriteFile(f, "[");
+  struct stat st;
+  ASSERT_EQ(stat(fresh.c_str(), &st), 0);
+  // Two minutes older than the file system's own clock says now.
+  const timespec times[2] = {{st.st_mtime - 120, 0}, {st.st_mtime - 120, 0}};
+  ASSERT_EQ(utimensat(AT_FDCWD, stale.c_str(), times, 0), 0);
+  ASSERT_EQ(utimensat(AT_FDCWD, other.c_str(), times, 0), 0);
+  FolderMgr().Save();
+  EXPECT_NE(stat(stale.c_str(), &st), 0) << "a killed save's file stays";
+  EXPECT_EQ(stat(fresh.c_str(), &st), 0) << "a save under way may own it";
+  EXPECT_EQ(stat(other.c_str(), &st), 0);
 }
 
 TEST_F(FolderMgrTest, UpsertOfAKnownPathReplacesItAndMovesItToTheEnd) {
