@@ -1,5 +1,6 @@
 #include "common/fs_util.h"
 
+#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -34,6 +35,19 @@ bool MVFileImpl(const std::string& from, const std::string& to, const sdk::CopyA
 }
 
 }  // namespace
+
+int OpenRegularFile(const std::string& path, int flags, unsigned int mode) {
+  int fd = open(path.c_str(), flags | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, mode);
+  if (fd < 0) return -1;
+  struct stat st;
+  if (fstat(fd, &st) != 0 || !S_ISREG(st.st_mode)) {
+    const bool dir = S_ISDIR(st.st_mode);
+    close(fd);
+    errno = dir ? EISDIR : EINVAL;
+    return -1;
+  }
+  return fd;
+}
 
 bool IsFileExist(const std::string& path) {
   struct stat st;
@@ -123,8 +137,8 @@ bool ChownVellis(const std::string& path) {
   sdk::UserInfo user;
   {
     LockMutex lock(sdk::SDKMutex());
-    VELLIS_THROW_IF(0 > sdk::GetPlatform()->QORUUserGet(kServiceUserName, &user),
-                    kErrServiceUser, std::string("QORUUserGet failed, user=") + kServiceUserName);
+    VELLIS_THROW_IF(0 > sdk::GetPlatform()->QORUUserGet(kServiceUserName, &user), kErrServiceUser,
+                    std::string("QORUUserGet failed, user=") + kServiceUserName);
   }
   return chown(path.c_str(), user.uid, user.gid) == 0;
 }

@@ -7,6 +7,13 @@
 
 namespace vellis {
 
+// open(2) of a regular file with `flags` plus O_CLOEXEC, O_NOFOLLOW and
+// O_NONBLOCK (`mode` when O_CREAT creates it): a symbolic link, FIFO,
+// socket, device or folder is refused without blocking. Returns the
+// descriptor, or -1 with errno set (EISDIR for a folder, EINVAL for any
+// other non-regular file).
+int OpenRegularFile(const std::string& path, int flags, unsigned int mode = 0644);
+
 // True when lstat succeeds and `path` is a regular file (a symbolic link is
 // not followed and counts as not existing).
 bool IsFileExist(const std::string& path);

@@ -4,9 +4,11 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <algorithm>
+#include <cerrno>
 #include <cstring>
+
+#include "common/fs_util.h"
 
 namespace vellis {
 namespace {
@@ -23,14 +25,8 @@ LineReader::~LineReader() {
 }
 
 bool LineReader::Open(const std::string& path) {
-  int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
+  int fd = OpenRegularFile(path, O_RDONLY);
   if (fd < 0) return false;
-  struct stat st;
-  if (fstat(fd, &st) != 0 || !S_ISREG(st.st_mode)) {
-    close(fd);
-    errno = S_ISDIR(st.st_mode) ? EISDIR : EINVAL;
-    return false;
-  }
   if (fd_ >= 0) close(fd_);
   fd_ = fd;
   begin_ = end_ = 0;

@@ -8,32 +8,15 @@
 #include <cerrno>
 #include <cstring>
 
+#include "common/fs_util.h"
 #include "common/log.h"
 #include "sdk/platform.h"
 
 namespace vellis {
-namespace {
-
-// Opens the lock file without following a link and without blocking on a
-// FIFO; anything but a regular file fails with errno set.
-int OpenLockFile(const std::string& path) {
-  int fd = open(path.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0644);
-  if (fd < 0) return -1;
-  struct stat st;
-  if (fstat(fd, &st) != 0 || !S_ISREG(st.st_mode)) {
-    close(fd);
-    errno = EINVAL;
-    return -1;
-  }
-  return fd;
-}
-
-}  // namespace
-
 LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(path) {
   int budget = kMaxAttempts;
   for (;;) {
-    VELLIS_THROW_IF(0 > (fd_ = OpenLockFile(path_)), kErrLock,
+    VELLIS_THROW_IF(0 > (fd_ = OpenRegularFile(path_, O_RDONLY | O_CREAT)), kErrLock,
                     "open failed, path=" + path_ + ", reason=" + strerror(errno));
     if (flock(fd_, (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB) == 0) return;
     int err = errno;

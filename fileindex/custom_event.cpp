@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <cstring>
 
+#include "common/fs_util.h"
 #include "common/json_util.h"
 #include "common/lock_file.h"
 #include "common/log.h"
@@ -18,36 +19,12 @@
 namespace vellis::fileindex {
 namespace {
 
-// mkdir -p: the queue's folder may not exist before the share's first
-// event; failures show up when the lock or the queue is opened.
-void MakeParentDirs(const std::string& file) {
-  std::string dir = Dirname(file);
-  for (size_t pos = 1; pos <= dir.size(); ++pos) {
-    if (pos == dir.size() || dir[pos] == '/') mkdir(dir.substr(0, pos).c_str(), 0755);
-  }
-}
-
-// Opens the queue for appending without following a link and without
-// blocking on a FIFO; anything but a regular file fails with errno set.
-int OpenQueueForAppend(const std::string& queue_path) {
-  int fd = open(queue_path.c_str(),
-                O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, 0644);
-  if (fd < 0) return -1;
-  struct stat st;
-  if (fstat(fd, &st) != 0 || !S_ISREG(st.st_mode)) {
-    close(fd);
-    errno = EINVAL;
-    return -1;
-  }
-  return fd;
-}
-
 // One write(2) of the whole line: O_APPEND places it at the end of the file
 // in one step, so the monitor appending at the same time cannot tear it.
 void AppendLine(const std::string& queue_path, const std::string& line) {
   int fd = -1;
-  VELLIS_THROW_IF(0 > (fd = OpenQueueForAppend(queue_path)), kErrInternal,
-                  "open failed, path=" + queue_path + ", reason=" + strerror(errno));
+  VELLIS_THROW_IF(0 > (fd = OpenRegularFile(queue_path, O_WRONLY | O_APPEND | O_CREAT)),
+                  kErrInternal, "open failed, path=" + queue_path + ", reason=" + strerror(errno));
   ssize_t written;
   do {
     written = write(fd, line.data(), line.size());
@@ -81,7 +58,9 @@ void AddCustomEvent(int event, const std::string& path, const std::string& path_
     line["data"] = data;
     const std::string text = JsonToString(line) + "\n";
 
-    MakeParentDirs(queue_path);
+    // The queue's folder may not exist before the share's first event;
+    // a failure shows when the lock or the queue is opened.
+    MakeDirs(Dirname(queue_path));
     LockFile lock(QueueLockPath(queue_path), true);
     AppendLine(queue_path, text);
     return;
