@@ -86,11 +86,22 @@ FrameStatus ReadFrame(int fd, std::string& out, int timeout_ms) {
   FrameStatus st = RecvAll(fd, reinterpret_cast<char*>(&length), sizeof(length), deadline, &got_any);
   if (st != FrameStatus::kOk) return st;
   if (length == 0 || length > kMaxMessageBytes) return FrameStatus::kBadLength;
-  out.assign(length, '\0');
-  st = RecvAll(fd, out.data(), length, deadline, &got_any);
-  if (st == FrameStatus::kClosed) st = FrameStatus::kTruncated;
-  if (st != FrameStatus::kOk) out.clear();
-  return st;
+  // The buffer grows with the bytes that actually arrive, so a large length
+  // announced by a peer that then sends little costs no memory.
+  out.clear();
+  char chunk[64 * 1024];
+  size_t left = length;
+  while (left > 0) {
+    size_t want = left < sizeof(chunk) ? left : sizeof(chunk);
+    st = RecvAll(fd, chunk, want, deadline, &got_any);
+    if (st != FrameStatus::kOk) {
+      out.clear();
+      return st == FrameStatus::kClosed ? FrameStatus::kTruncated : st;
+    }
+    out.append(chunk, want);
+    left -= want;
+  }
+  return FrameStatus::kOk;
 }
 
 FrameStatus WriteFrame(int fd, const std::string& message, int timeout_ms) {

@@ -30,7 +30,7 @@ constexpr int kDefaultWorkers = 4;
 
 void Log(int priority, const std::string& text) { vellis::sdk::GetPlatform()->Syslog(priority, text); }
 
-int Serve(int workers) {
+int Serve(int workers, int recv_timeout_ms) {
   using namespace vellis::searchd;
   // Block the stop signals in every thread; they arrive on a descriptor.
   sigset_t stop;
@@ -47,6 +47,7 @@ int Serve(int workers) {
   SqliteEngine engine(vellis::RootPath(kRegistryPath));
   Handler handler(engine);
   Server server(handler, vellis::RootPath(kSocketPath));
+  server.set_recv_timeout_ms(recv_timeout_ms);
   server.Listen();
   Log(LOG_INFO, "searchd: listening on " + vellis::RootPath(kSocketPath));
   server.Run(stop_fd, workers);
@@ -65,12 +66,16 @@ int main(int argc, char** argv) {
   app.add_flag("-f,--foreground", foreground, "Stay attached to the terminal (default: detach)");
   app.add_option("--workers", workers, "Threads reading requests (requests run one at a time)")
       ->check(CLI::Range(1, 64));
+  int recv_timeout_ms = vellis::searchd::kRecvTimeoutMs;
+  app.add_option("--recv-timeout-ms", recv_timeout_ms,
+                 "Time a whole request may take to arrive before the connection is dropped")
+      ->check(CLI::Range(1, 3600 * 1000));
   CLI11_PARSE(app, argc, argv);
 
   openlog("vellis-searchd", LOG_PID | (foreground ? LOG_PERROR : 0), LOG_DAEMON);
   try {
     if (!foreground) vellis::searchd::Daemonize();
-    return Serve(workers);
+    return Serve(workers, recv_timeout_ms);
   } catch (const vellis::Error& e) {
     Log(LOG_ERR, "searchd: cannot run: code=" + std::to_string(e.GetCode()) + ", reason=" + e.what());
   } catch (const std::exception& e) {

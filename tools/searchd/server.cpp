@@ -72,7 +72,7 @@ void Server::Listen() {
 
 void Server::ServeConnection(int fd) {
   std::string request;
-  FrameStatus st = ReadFrame(fd, request);
+  FrameStatus st = ReadFrame(fd, request, recv_timeout_ms_);
   if (st == FrameStatus::kOk) {
     std::string answer = handler_.HandleText(request);
     st = WriteFrame(fd, answer);

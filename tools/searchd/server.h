@@ -8,6 +8,7 @@
 
 #include <string>
 
+#include "tools/searchd/frame.h"
 #include "tools/searchd/handler.h"
 
 namespace vellis::searchd {
@@ -37,7 +38,11 @@ class Server {
   // Reads one request from the connected `fd`, answers it and closes `fd`.
   void ServeConnection(int fd);
 
+  // The time a whole request may take to arrive (default kRecvTimeoutMs).
+  void set_recv_timeout_ms(int ms) { recv_timeout_ms_ = ms; }
+
  private:
+  int recv_timeout_ms_ = kRecvTimeoutMs;
   Handler& handler_;
   std::string socket_path_;
   int listen_fd_ = -1;

@@ -42,6 +42,13 @@ void MoveFile(const std::string& from, const std::string& to) {
   fs::remove(from, ec);
 }
 
+// The folder without trailing slashes, so "/a/b/" and "/a/b" are one folder.
+std::string NormalFolder(const std::string& path) {
+  std::string f = fs::path(path).lexically_normal().string();
+  while (f.size() > 1 && f.back() == '/') f.pop_back();
+  return f;
+}
+
 void MakeFolder(const std::string& path) {
   std::error_code ec;
   fs::create_directories(path, ec);
@@ -85,17 +92,18 @@ SqliteIndex& SqliteEngine::OpenForWrite(const std::string& id) {
 }
 
 void SqliteEngine::CreateIndex(const IndexSpec& spec) {
+  std::string folder = NormalFolder(spec.path);
   if (const RegistryEntry* e = registry_.Find(spec.id)) {
-    if (fs::path(e->path).lexically_normal() == fs::path(spec.path).lexically_normal()) return;
+    if (e->path == folder) return;
     throw Error(kErrIndexExists, "Index " + spec.id + " exists in another folder: " + e->path);
   }
   Schema::FromMappings(spec.mappings);  // refuse bad mappings before touching files
-  MakeFolder(spec.path);
-  std::string file = DbFile(spec.path, spec.id);
+  MakeFolder(folder);
+  std::string file = DbFile(folder, spec.id);
   bool existed = Exists(file);
   auto index = std::make_unique<SqliteIndex>(file, &spec);
   try {
-    registry_.Put(spec.id, RegistryEntry{spec.path, false});
+    registry_.Put(spec.id, RegistryEntry{folder, false});
   } catch (...) {
     index.reset();
     if (!existed) {
@@ -124,7 +132,7 @@ void SqliteEngine::Reconfigure(const std::string& id, const std::string& new_id,
                                const std::string& new_path) {
   RegistryEntry e = Entry(id);
   std::string target_id = new_id.empty() ? id : new_id;
-  std::string target_path = new_path.empty() ? e.path : new_path;
+  std::string target_path = new_path.empty() ? e.path : NormalFolder(new_path);
   if (target_id != id && registry_.Find(target_id) != nullptr) {
     throw Error(kErrIndexExists, "Index " + target_id + " exists");
   }
