@@ -1,0 +1,258 @@
+// The daemon as a process: its socket, its framing, crashes and stops.
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <atomic>
+#include <chrono>
+#include <cstring>
+#include <thread>
+
+#include "common/json_util.h"
+#include "common/root_path.h"
+#include "tests/support/temp_root.h"
+#include "tests/tools/searchd/searchd_fixture.h"
+#include "tools/searchd/client.h"
+#include "tools/searchd/frame.h"
+#include "tools/searchd/process.h"
+
+namespace vellis::searchd::testing {
+namespace {
+
+using ::vellis::testing::ReadFile;
+using ::vellis::testing::TempRoot;
+
+constexpr char kIndex[] = "fileindex_s";
+// Short, so that stalled-peer cases finish quickly.
+constexpr int kTestRecvTimeoutMs = 300;
+
+std::string DaemonBinary() {
+  const char* dir = getenv("VELLIS_TEST_BINARY_DIR");
+  return std::string(dir ? dir : ".") + "/tools/searchd/vellis-searchd";
+}
+
+int ConnectTo(const std::string& path) {
+  struct sockaddr_un addr;
+  memset(&addr, 0, sizeof(addr));
+  addr.sun_family = AF_UNIX;
+  strncpy(addr.sun_path, path.c_str(), sizeof(addr.sun_path) - 1);
+  int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  if (connect(fd, reinterpret_cast<struct sockaddr*>(&addr), sizeof(addr)) != 0) {
+    close(fd);
+    return -1;
+  }
+  return fd;
+}
+
+class DaemonTest : public ::testing::Test {
+ protected:
+  void SetUp() override { Start(); }
+  void TearDown() override {
+    if (pid_ > 0) Stop(SIGKILL);
+  }
+
+  // Starts the daemon in the foreground and waits for its socket.
+  void Start() {
+    pid_ = fork();
+    if (pid_ == 0) {
+      // The daemon copies its log lines to stderr in the foreground.
+      freopen("/dev/null", "w", stderr);
+      std::string timeout = "--recv-timeout-ms=" + std::to_string(kTestRecvTimeoutMs);
+      execl(DaemonBinary().c_str(), "vellis-searchd", "--foreground", timeout.c_str(),
+            static_cast<char*>(nullptr));
+      _exit(127);
+    }
+    for (int i = 0; i < 500; ++i) {
+      int status = 0;
+      if (waitpid(pid_, &status, WNOHANG) == pid_) {
+        pid_ = -1;
+        FAIL() << "daemon " << DaemonBinary() << " exited at start, status " << status;
+      }
+      int fd = ConnectTo(socket_);
+      if (fd >= 0) {
+        close(fd);
+        return;
+      }
+      std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    FAIL() << "daemon did not come up";
+  }
+
+  // Sends `sig` and returns the exit status (or -signal).
+  int Stop(int sig) {
+    kill(pid_, sig);
+    int status = 0;
+    waitpid(pid_, &status, 0);
+    pid_ = -1;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+  }
+
+  Json::Value Call(const Json::Value& request) { return Exchange(socket_, request); }
+  Json::Value Ok(const Json::Value& request) {
+    Json::Value answer = Call(request);
+    EXPECT_TRUE(answer["success"].asBool()) << JsonToString(request).substr(0, 300) << " -> "
+                                            << JsonToString(answer);
+    return answer["data"];
+  }
+  Json::Value Data() {
+    Json::Value d(Json::objectValue);
+    d["id"] = kIndex;
+    return d;
+  }
+  int64_t DocumentCount() { return Ok(Request("index_stats", Data()))["documents"].asInt64(); }
+
+  TempRoot root_;
+  std::string socket_ = RootPath(kSocketPath);
+  pid_t pid_ = -1;
+};
+
+TEST_F(DaemonTest, WritesItsPidFileAndRefusesASecondInstance) {
+  EXPECT_EQ(ReadFile(RootPath(kPidFilePath)), std::to_string(pid_) + "\n");
+  pid_t second = fork();
+  if (second == 0) {
+    execl(DaemonBinary().c_str(), "vellis-searchd", "--foreground", static_cast<char*>(nullptr));
+    _exit(127);
+  }
+  int status = 0;
+  waitpid(second, &status, 0);
+  EXPECT_TRUE(WIFEXITED(status));
+  EXPECT_EQ(WEXITSTATUS(status), 1);
+  EXPECT_TRUE(Ok(Request("index_list", Json::Value(Json::objectValue))).isArray())
+      << "the first daemon still serves";
+}
+
+TEST_F(DaemonTest, BadFramesAreDroppedWithoutAnAnswer) {
+  auto frame = [](uint32_t length, const std::string& body) {
+    std::string out(reinterpret_cast<const char*>(&length), sizeof(length));
+    return out + body;
+  };
+  uint32_t small = 10;
+  uint32_t swapped = __builtin_bswap32(small);  // 167 MiB announced, 10 bytes sent
+  struct Case {
+    const char* what;
+    std::string bytes;
+  };
+  const Case cases[] = {
+      {"length 0", frame(0, "")},
+      {"length 0xFFFFFFFF", frame(0xFFFFFFFFu, "{}")},
+      {"length above the maximum", frame(kMaxMessageBytes + 1, "{}")},
+      {"byte-swapped length", frame(swapped, "{\"a\": 12}")},
+      {"truncated frame then end of stream", frame(100, "{\"command\"")},
+      {"half a length", std::string("\x05\x00", 2)},
+  };
+  for (const Case& c : cases) {
+    int fd = ConnectTo(socket_);
+    ASSERT_GE(fd, 0) << c.what;
+    ASSERT_EQ(send(fd, c.bytes.data(), c.bytes.size(), MSG_NOSIGNAL),
+              static_cast<ssize_t>(c.bytes.size()))
+        << c.what;
+    shutdown(fd, SHUT_WR);
+    std::string answer;
+    auto started = std::chrono::steady_clock::now();
+    EXPECT_EQ(ReadFrame(fd, answer, 5000), FrameStatus::kClosed) << c.what << ": " << answer;
+    EXPECT_LT(std::chrono::steady_clock::now() - started, std::chrono::seconds(3)) << c.what;
+    close(fd);
+  }
+  // A peer that stalls mid-frame without closing is dropped at the time-out.
+  int fd = ConnectTo(socket_);
+  std::string partial = frame(50, "{\"com");
+  send(fd, partial.data(), partial.size(), MSG_NOSIGNAL);
+  std::string answer;
+  EXPECT_EQ(ReadFrame(fd, answer, 5000), FrameStatus::kClosed);
+  close(fd);
+  EXPECT_TRUE(Ok(Request("index_list", Json::Value(Json::objectValue))).isArray())
+      << "the daemon survived every bad frame";
+}
+
+TEST_F(DaemonTest, TextThatIsNotARequestIsAnsweredWithAnError) {
+  const std::string texts[] = {"hello", "{\"command\": \"index_list\"} x", "{\"command\": \"index_list\"}\n\n{}",
+                               std::string("{\"command\": \"index_list\"}\0", 26), "\xff\xfe{}"};
+  for (const std::string& text : texts) {
+    Json::Value answer = Parse(ExchangeText(socket_, text));
+    EXPECT_FALSE(answer["success"].asBool()) << text;
+    EXPECT_EQ(answer["error"]["code"].asInt(), 1100) << text;
+  }
+}
+
+TEST_F(DaemonTest, KillAfterCommitLosesNothingCommitted) {
+  Ok(CreateRequest(kIndex, root_.Path("/volume1/@qoruindex")));
+  Json::Value batch(Json::objectValue);
+  for (int i = 0; i < 50; ++i) {
+    Json::Value doc = FileDoc("/v/s/kept" + std::to_string(i) + ".txt");
+    doc["QORUMDTextContent"] = "durable words";
+    batch["compound"].append(UpsertRequest(kIndex, doc));
+  }
+  EXPECT_FALSE(Call(batch)["has_fail"].asBool());
+  Ok(Request("commit", Data()));
+  Ok(UpsertRequest(kIndex, FileDoc("/v/s/uncommitted.txt")));
+  EXPECT_EQ(DocumentCount(), 51);
+
+  EXPECT_EQ(Stop(SIGKILL), -SIGKILL);
+  Start();
+  EXPECT_EQ(DocumentCount(), 50);
+  Json::Value search = Data();
+  search["query"] = "durable";
+  EXPECT_EQ(Ok(Request("document_search", search))["total"].asInt(), 50);
+  Ok(UpsertRequest(kIndex, FileDoc("/v/s/after.txt")));
+  EXPECT_EQ(DocumentCount(), 51) << "the index takes writes again after the crash";
+}
+
+TEST_F(DaemonTest, TermStopsCleanlyAndKeepsPendingWrites) {
+  Ok(CreateRequest(kIndex, root_.Path("/volume1/@qoruindex")));
+  Ok(UpsertRequest(kIndex, FileDoc("/v/s/pending.txt")));
+  EXPECT_EQ(Stop(SIGTERM), 0);
+  EXPECT_NE(access(socket_.c_str(), F_OK), 0) << "socket file removed";
+  EXPECT_NE(access(RootPath(kPidFilePath).c_str(), F_OK), 0) << "pid file removed";
+  Start();
+  EXPECT_EQ(DocumentCount(), 1);
+}
+
+TEST_F(DaemonTest, SearchWhileTenThousandDocumentsAreWritten) {
+  Ok(CreateRequest(kIndex, root_.Path("/volume1/@qoruindex")));
+  for (int i = 0; i < 10; ++i) {
+    Json::Value doc = FileDoc("/v/s/seed/needle" + std::to_string(i) + ".txt");
+    doc["QORUMDTextContent"] = "needle haystack";
+    Ok(UpsertRequest(kIndex, doc));
+  }
+  Ok(Request("commit", Data()));
+
+  std::atomic<bool> done{false};
+  std::thread writer([&] {
+    for (int batch = 0; batch < 20; ++batch) {
+      Json::Value req(Json::objectValue);
+      for (int i = 0; i < 500; ++i) {
+        Json::Value doc = FileDoc("/v/s/bulk/" + std::to_string(batch) + "/f" + std::to_string(i) + ".txt");
+        doc["QORUMDTextContent"] = "haystack straw number " + std::to_string(batch * 500 + i);
+        req["compound"].append(UpsertRequest(kIndex, doc));
+      }
+      EXPECT_FALSE(Call(req)["has_fail"].asBool());
+    }
+    Ok(Request("commit", Data()));
+    done = true;
+  });
+  int searches = 0;
+  int64_t last_haystack = 0;
+  while (!done) {
+    Json::Value needle = Data();
+    needle["query"] = "needle";
+    Json::Value found = Ok(Request("document_search", needle));
+    EXPECT_EQ(found["total"].asInt(), 10);
+    EXPECT_EQ(found["hits"].size(), 10u);
+    Json::Value hay = Data();
+    hay["query"] = "haystack";
+    hay["limit"] = 1;
+    int64_t total = Ok(Request("document_search", hay))["total"].asInt64();
+    EXPECT_GE(total, last_haystack) << "counts only grow while documents are added";
+    last_haystack = total;
+    ++searches;
+  }
+  writer.join();
+  EXPECT_GT(searches, 0);
+  EXPECT_EQ(DocumentCount(), 10010);
+}
+
+}  // namespace
+}  // namespace vellis::searchd::testing
