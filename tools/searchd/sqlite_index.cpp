@@ -97,8 +97,6 @@ std::string CatchAllExpr(const QueryTerm& t) {
   return expr;
 }
 
-const char* kFtsIn = "rid IN (SELECT rowid FROM fts WHERE fts MATCH ?)";
-const char* kNameIn = "rid IN (SELECT rowid FROM fts_name WHERE fts_name MATCH ?)";
 
 }  // namespace
 
@@ -152,9 +150,10 @@ Stmt& SqliteIndex::Cached(const std::string& sql) {
 void SqliteIndex::CreateTables() {
   db_->Exec(
       "CREATE TABLE IF NOT EXISTS meta(key TEXT PRIMARY KEY, value TEXT NOT NULL);"
+      // Small columns first: filters then never read through the body.
       "CREATE TABLE IF NOT EXISTS docs(rid INTEGER PRIMARY KEY, doc_id TEXT NOT NULL UNIQUE,"
-      " body TEXT NOT NULL, has_content INTEGER NOT NULL, name TEXT NOT NULL,"
-      " ext TEXT NOT NULL, size INTEGER, mtime INTEGER);"
+      " name TEXT NOT NULL, ext TEXT NOT NULL, size INTEGER, mtime INTEGER,"
+      " has_content INTEGER NOT NULL, body TEXT NOT NULL);"
       "CREATE INDEX IF NOT EXISTS docs_name ON docs(name COLLATE NOCASE);"
       "CREATE INDEX IF NOT EXISTS docs_size ON docs(size);"
       "CREATE INDEX IF NOT EXISTS docs_mtime ON docs(mtime);"
@@ -408,8 +407,14 @@ int64_t SqliteIndex::CountDocuments() {
 }
 
 SearchResult SqliteIndex::Search(const SearchQuery& q) {
-  Where where;
-  std::string rank_expr;  // OR of the full-text parts, for scores and snippets
+  // The full-text parts select candidate rows (all must hold): plain FTS5
+  // expressions are ANDed into one MATCH; a term that may also match a file
+  // name is a union of two row sets. The query is driven from these rows,
+  // so a search reads only the rows that match, never the whole table.
+  std::vector<std::string> fts_and;
+  std::vector<std::pair<std::string, std::vector<Bound>>> sets;
+  Where where;            // conditions on the candidate rows
+  std::string rank_expr;  // OR of the full-text words, for scores and snippets
   auto add_rank = [&rank_expr](const std::string& e) {
     rank_expr += (rank_expr.empty() ? "(" : " OR (") + e + ")";
   };
@@ -422,10 +427,11 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
       std::string expr = CatchAllExpr(whole);
       add_rank(expr);
       if (CodePointCount(whole.text) >= 3) {
-        where.Add(std::string("(") + kFtsIn + " OR " + kNameIn + ")",
-                  {expr, FtsQuote(FoldCase(whole.text))});
+        sets.push_back({"SELECT rowid AS r FROM fts WHERE fts MATCH ?"
+                        " UNION SELECT rowid FROM fts_name WHERE fts_name MATCH ?",
+                        {expr, FtsQuote(FoldCase(whole.text))}});
       } else {
-        where.Add(kFtsIn, {expr});
+        fts_and.push_back(expr);
       }
       continue;
     }
@@ -438,11 +444,11 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
         where.Add("doc_id = ?", {t.text});
       }
     } else if (spec.analyzer == Analyzer::kKeyword) {
-      where.Add(kFtsIn, {"{kw} : " + FtsQuote(HexToken(t.field + ":" + t.text)) + Star(t)});
+      fts_and.push_back("{kw} : " + FtsQuote(HexToken(t.field + ":" + t.text)) + Star(t));
     } else if (t.field == kContentField) {
       std::string expr = "{content} : " + FtsQuote(t.text) + Star(t);
       add_rank(expr);
-      where.Add(kFtsIn, {expr});
+      fts_and.push_back(expr);
     } else if (spec.type == FieldType::kInt || spec.type == FieldType::kDouble ||
                spec.type == FieldType::kBool) {
       Bound value;
@@ -468,7 +474,7 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
   if (!q.name.empty()) {
     std::string folded = FoldCase(q.name);
     if (CodePointCount(folded) >= 3) {
-      where.Add(kNameIn, {FtsQuote(folded)});
+      sets.push_back({"SELECT rowid AS r FROM fts_name WHERE fts_name MATCH ?", {FtsQuote(folded)}});
     } else {
       // Too short for trigrams: a scan of the names.
       where.Add("instr(fold(name), ?) > 0", {folded});
@@ -502,10 +508,32 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
   if (q.modified_from) where.Add("mtime >= ?", {*q.modified_from});
   if (q.modified_to) where.Add("mtime <= ?", {*q.modified_to});
 
+  // FROM: the candidate rows joined to their documents (CROSS JOIN keeps
+  // the candidates as the outer loop), or all documents.
+  std::string from;
+  std::vector<Bound> from_binds;
+  std::string candidates;
+  if (!fts_and.empty()) {
+    std::string all;
+    for (const std::string& e : fts_and) all += (all.empty() ? "(" : " AND (") + e + ")";
+    candidates = "SELECT rowid AS r FROM fts WHERE fts MATCH ?";
+    from_binds.push_back(all);
+  }
+  for (auto& [sql, binds] : sets) {
+    candidates += (candidates.empty() ? "" : " INTERSECT ") + std::string("SELECT r FROM (") + sql + ")";
+    from_binds.insert(from_binds.end(), binds.begin(), binds.end());
+  }
+  if (candidates.empty()) {
+    from = "docs";
+  } else {
+    from = "(" + candidates + ") AS c CROSS JOIN docs ON docs.rid = c.r";
+  }
+
   SearchResult result;
   {
-    Stmt count(db_->get(), "SELECT count(*) FROM docs WHERE 1" + where.sql);
-    BindAll(count, where.binds, 1);
+    Stmt count(db_->get(), "SELECT count(*) FROM " + from + " WHERE 1" + where.sql);
+    BindAll(count, from_binds, 1);
+    BindAll(count, where.binds, static_cast<int>(from_binds.size()) + 1);
     count.Step();
     result.total = count.Int(0);
   }
@@ -528,13 +556,15 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
       break;
   }
   std::string sql = "SELECT rid, doc_id, body, has_content, ";
-  std::vector<Bound> binds;
-  if (!rank_expr.empty()) {
-    sql += "score FROM docs LEFT JOIN (SELECT rowid AS r, bm25(fts) AS score FROM fts"
-           " WHERE fts MATCH ?) ON r = rid";
+  std::vector<Bound> binds = from_binds;
+  bool scored = !rank_expr.empty() && q.sort == SortKey::kRelevance;
+  if (scored) {
+    sql += "score FROM " + from +
+           " LEFT JOIN (SELECT rowid AS sr, bm25(fts) AS score FROM fts WHERE fts MATCH ?) AS s"
+           " ON s.sr = docs.rid";
     binds.push_back(rank_expr);
   } else {
-    sql += "NULL FROM docs";
+    sql += "NULL FROM " + from;
   }
   sql += " WHERE 1" + where.sql + " ORDER BY " + order + " LIMIT ? OFFSET ?";
   binds.insert(binds.end(), where.binds.begin(), where.binds.end());
