@@ -221,7 +221,8 @@ IndexedForms Schema::Analyze(const Json::Value& doc) const {
       }
       for (const Json::Value& e : values) {
         std::string one = ValueText(e);
-        Append(forms.kw, HexToken(name + ":" + one));
+        // The identity has its own column; no need to index it twice.
+        if (name != property_id_) Append(forms.kw, HexToken(name + ":" + one));
         if (spec.in_all) Append(forms.ws_all, HexToken(FoldCase(one)));
       }
       continue;

@@ -5,8 +5,14 @@
 // Durability: the database runs in WAL mode with synchronous=FULL. Writes
 // collect in one open transaction that Commit() ends; a committed
 // transaction survives a crash of the process and a power cut, uncommitted
-// writes do not. Each document write runs in its own savepoint, so a failed
-// write leaves nothing of itself behind.
+// writes do not.
+//
+// Failed writes: a document is checked whole (types, required fields,
+// identity) before anything is written, so a bad document changes nothing.
+// Should the storage itself fail in the middle of a write (disk full, I/O
+// error), the open transaction is rolled back, so no half-written document
+// remains, and the next Commit() throws kErrStorage to tell that writes since
+// the previous commit were lost.
 //
 // Not thread-safe: one caller at a time.
 #pragma once
@@ -44,6 +50,8 @@ class SqliteIndex {
   int64_t DeleteByPrefix(const std::string& field, const std::string& prefix);
   Json::Value GetByPrefix(const std::string& field, const std::string& prefix,
                           const std::vector<std::string>& load_fields);
+  // Ends the open transaction. Throws kErrStorage after a rolled-back
+  // failure (see above), having committed the writes made since.
   void Commit();
   int64_t CountDocuments();
   SearchResult Search(const SearchQuery& query);
@@ -62,7 +70,8 @@ class SqliteIndex {
   // Writes `doc` (normalised) under `doc_id`, replacing row `rid` when not 0.
   void WriteRow(int64_t rid, const std::string& doc_id, const Json::Value& doc);
   void DeleteRow(int64_t rid);
-  // Runs `fn` inside a savepoint: all of it or nothing.
+  // Runs `fn` in the open write transaction; on a failure rolls the
+  // transaction back and remembers the loss for Commit().
   template <typename Fn>
   void Atomically(Fn&& fn);
   // The document of a row as stored (body plus the text content).
@@ -77,6 +86,7 @@ class SqliteIndex {
   // Declared after db_: statements are finalised before the connection.
   std::map<std::string, std::unique_ptr<Stmt>> cache_;
   Schema schema_;
+  bool lost_writes_ = false;
 };
 
 }  // namespace vellis::searchd
