@@ -9,6 +9,7 @@
 //
 //   build/bench/searchd_bench [--benchmark_filter=...]
 //   SEARCHD_BENCH_DOCS=20000 build/bench/searchd_bench
+//   SEARCHD_BENCH_KEEP=1 ... keeps the index files (the path is printed)
 #include <benchmark/benchmark.h>
 #include <sqlite3.h>
 #include <sys/stat.h>
@@ -375,6 +376,10 @@ int main(int argc, char** argv) {
   }
   const char* env = getenv("SEARCHD_BENCH_DOCS");
   MeasureSearch(env ? atoll(env) : 100000);
+  if (getenv("SEARCHD_BENCH_KEEP") != nullptr) {
+    printf("index kept in %s/db\n", TempDir().c_str());
+    return 0;
+  }
   char cmd[512];
   snprintf(cmd, sizeof(cmd), "rm -rf '%s'", TempDir().c_str());
   if (system(cmd) != 0) fprintf(stderr, "could not remove %s\n", TempDir().c_str());

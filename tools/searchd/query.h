@@ -62,6 +62,10 @@ struct SearchHit {
 
 struct SearchResult {
   int64_t total = 0;
+  // True when the hits are in relevance order: query words were given, the
+  // sort is by relevance and the matches were few enough to score all of
+  // them (otherwise the most recently indexed documents come first).
+  bool ranked = false;
   std::vector<SearchHit> hits;
 };
 

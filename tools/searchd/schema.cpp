@@ -210,7 +210,13 @@ IndexedForms Schema::Analyze(const Json::Value& doc) const {
     const Json::Value& v = doc[name];
     const FieldSpec& spec = Spec(name);
     std::string text = ValueText(v);
-    if (spec.ngram) Append(forms.name, spec.lower ? FoldCase(text) : text);
+    if (spec.ngram) {
+      Append(forms.name, spec.lower ? FoldCase(text) : text);
+      // Its words also join the catch-all, so that a query word finds a file
+      // by a word of its name ("0001" in IMG_0001.JPG); substrings go
+      // through `name`.
+      if (spec.in_all) Append(forms.std_all, text);
+    }
     if (spec.analyzer == Analyzer::kKeyword) {
       // A keyword field matches whole values only, each element of an array
       // being a value of its own.

@@ -65,6 +65,7 @@ Json::Value SearchResultToJson(const SearchResult& result, const SearchQuery& qu
   Json::Value out(Json::objectValue);
   out["total"] = static_cast<Json::Int64>(result.total);
   out["offset"] = static_cast<Json::Int64>(query.offset);
+  out["ranked"] = result.ranked;
   out["hits"] = Json::Value(Json::arrayValue);
   for (const SearchHit& hit : result.hits) {
     Json::Value h(Json::objectValue);

@@ -18,7 +18,7 @@ inline constexpr int64_t kMaxSearchLimit = 1000;
 // key or category, negative offset, limit above kMaxSearchLimit).
 SearchQuery ParseSearchRequest(const Json::Value& data);
 
-// {"total", "offset", "hits": [{"id", "score", "fields", "snippet"}]}.
+// {"total", "offset", "ranked", "hits": [{"id", "score", "fields", "snippet"}]}.
 Json::Value SearchResultToJson(const SearchResult& result, const SearchQuery& query);
 
 }  // namespace vellis::searchd

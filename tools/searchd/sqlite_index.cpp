@@ -30,8 +30,11 @@ constexpr size_t kExcerptBytes = 200;
 // Segments that FTS5 lets accumulate on a level before merging them.
 constexpr int kAutomerge = 8;
 constexpr int kPageSize = 8192;
+constexpr int64_t kWalKeepBytes = 16LL * 1024 * 1024;
 // Reads through a memory map instead of read() calls (address space only).
 constexpr int64_t kMmapBytes = 256LL * 1024 * 1024;
+// The most matches that a search ranks by relevance (see Search).
+constexpr int64_t kMaxRankedMatches = 10000;
 // Page cache per open index, in KiB.
 constexpr int kCacheKiB = 32 * 1024;
 
@@ -118,6 +121,9 @@ SqliteIndex::SqliteIndex(const std::string& file, const IndexSpec* spec)
   // Full-text merges revisit many pages: a larger cache saves rereading them.
   db_->Exec("PRAGMA cache_size=-" + std::to_string(kCacheKiB));
   db_->Exec("PRAGMA mmap_size=" + std::to_string(kMmapBytes));
+  // The log file is cut back after a checkpoint instead of keeping the size
+  // of the largest transaction.
+  db_->Exec("PRAGMA journal_size_limit=" + std::to_string(kWalKeepBytes));
   sqlite3_create_function(db_->get(), "fold", 1, SQLITE_UTF8 | SQLITE_DETERMINISTIC, nullptr,
                           FoldFunction, nullptr, nullptr);
   CreateTables();
@@ -453,13 +459,7 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
       if (!t.field.empty()) whole.text = t.field + ":" + t.text;
       std::string expr = CatchAllExpr(whole);
       add_rank(expr);
-      if (CodePointCount(whole.text) >= 3) {
-        sets.push_back({"SELECT rowid AS r FROM fts WHERE fts MATCH ?"
-                        " UNION SELECT rowid FROM fts_name WHERE fts_name MATCH ?",
-                        {expr, FtsQuote(FoldCase(whole.text))}});
-      } else {
-        fts_and.push_back(expr);
-      }
+      fts_and.push_back(expr);
       continue;
     }
     const FieldSpec& spec = schema_.Spec(t.field);
@@ -535,80 +535,104 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
   if (q.modified_from) where.Add("mtime >= ?", {*q.modified_from});
   if (q.modified_to) where.Add("mtime <= ?", {*q.modified_to});
 
-  // FROM: the candidate rows joined to their documents (CROSS JOIN keeps
-  // the candidates as the outer loop), or all documents.
-  std::string from;
-  std::vector<Bound> from_binds;
-  std::string candidates;
-  if (!fts_and.empty()) {
-    std::string all;
-    for (const std::string& e : fts_and) all += (all.empty() ? "(" : " AND (") + e + ")";
-    candidates = "SELECT rowid AS r FROM fts WHERE fts MATCH ?";
-    from_binds.push_back(all);
-  }
-  for (auto& [sql, binds] : sets) {
-    candidates += (candidates.empty() ? "" : " INTERSECT ") + std::string("SELECT r FROM (") + sql + ")";
-    from_binds.insert(from_binds.end(), binds.begin(), binds.end());
-  }
-  if (candidates.empty()) {
-    from = "docs";
-  } else {
-    from = "(" + candidates + ") AS c CROSS JOIN docs ON docs.rid = c.r";
-  }
+  // The candidate rows: one full-text query, narrowed by row sets that
+  // must also hold. With words to rank by they carry their bm25 score.
+  std::vector<Bound> cand_binds;
+  std::string fts_all;
+  for (const std::string& e : fts_and) fts_all += (fts_all.empty() ? "(" : " AND (") + e + ")";
+  if (!fts_all.empty()) cand_binds.push_back(fts_all);
+  for (auto& set : sets) cand_binds.insert(cand_binds.end(), set.second.begin(), set.second.end());
+  auto candidates = [&](bool with_score) {
+    std::string sql;
+    if (!fts_all.empty()) {
+      sql = std::string("SELECT rowid AS r") + (with_score ? ", bm25(fts) AS score" : "") +
+            " FROM fts WHERE fts MATCH ?";
+    }
+    for (auto& set : sets) {
+      sql = sql.empty() ? set.first : "SELECT * FROM (" + sql + ") WHERE r IN (" + set.first + ")";
+    }
+    return sql;
+  };
+  bool driven = !candidates(false).empty();
+  bool row_checks = !where.sql.empty();
+  // FROM: the candidates joined to their documents (CROSS JOIN keeps the
+  // candidates as the outer loop), or all documents.
+  auto from = [&](bool with_score) {
+    if (!driven) return std::string("docs");
+    return "(" + candidates(with_score) + ") AS c CROSS JOIN docs ON docs.rid = c.r";
+  };
 
   SearchResult result;
   {
-    Stmt count(db_->get(), "SELECT count(*) FROM " + from + " WHERE 1" + where.sql);
-    BindAll(count, from_binds, 1);
-    BindAll(count, where.binds, static_cast<int>(from_binds.size()) + 1);
+    // Without checks on the rows the matches are counted alone.
+    std::string sql = driven && !row_checks
+                          ? "SELECT count(*) FROM (" + candidates(false) + ")"
+                          : "SELECT count(*) FROM " + from(false) + " WHERE 1" + where.sql;
+    Stmt count(db_->get(), sql);
+    BindAll(count, cand_binds, 1);
+    BindAll(count, where.binds, static_cast<int>(cand_binds.size()) + 1);
     count.Step();
     result.total = count.Int(0);
   }
   if (result.total == 0 || q.limit <= 0) return result;
 
+  // Ranking means scoring every match; beyond kMaxRankedMatches that costs
+  // more than a search may take (and words that common weigh nothing in
+  // bm25), so the newest documents come first instead.
+  bool scored = !rank_expr.empty() && q.sort == SortKey::kRelevance;
+  if (scored && result.total > kMaxRankedMatches) scored = false;
+  result.ranked = scored;
+
   const char* dir = q.descending ? " DESC" : "";
   std::string order;
   switch (q.sort) {
     case SortKey::kRelevance:
-      order = rank_expr.empty() ? "rid" : "score IS NULL, score, rid";
+      order = scored ? "score, r" : "r DESC";
       break;
     case SortKey::kName:
-      order = std::string("name COLLATE NOCASE") + dir + ", rid";
+      order = std::string("name COLLATE NOCASE") + dir + ", r";
       break;
     case SortKey::kSize:
-      order = std::string("size") + dir + ", rid";
+      order = std::string("size") + dir + ", r";
       break;
     case SortKey::kModified:
-      order = std::string("mtime") + dir + ", rid";
+      order = std::string("mtime") + dir + ", r";
       break;
   }
-  std::string sql = "SELECT rid, doc_id, body, has_content, ";
-  std::vector<Bound> binds = from_binds;
-  bool scored = !rank_expr.empty() && q.sort == SortKey::kRelevance;
-  if (scored) {
-    sql += "score FROM " + from +
-           " LEFT JOIN (SELECT rowid AS sr, bm25(fts) AS score FROM fts WHERE fts MATCH ?) AS s"
-           " ON s.sr = docs.rid";
-    binds.push_back(rank_expr);
+  // Phase one: the page's row ids (from the full-text query alone when the
+  // order needs nothing of the rows); phase two: their documents.
+  std::string sql;
+  if (driven && !row_checks && q.sort == SortKey::kRelevance) {
+    sql = std::string("SELECT r, ") + (scored ? "score" : "NULL") + " FROM (" + candidates(scored) +
+          ")";
   } else {
-    sql += "NULL FROM " + from;
+    sql = std::string("SELECT rid AS r, ") + (scored ? "score" : "NULL") + " FROM " +
+          from(scored) + " WHERE 1" + where.sql;
   }
-  sql += " WHERE 1" + where.sql + " ORDER BY " + order + " LIMIT ? OFFSET ?";
+  sql += " ORDER BY " + order + " LIMIT ? OFFSET ?";
+  std::vector<Bound> binds = cand_binds;
   binds.insert(binds.end(), where.binds.begin(), where.binds.end());
   binds.push_back(q.limit);
   binds.push_back(q.offset);
-  Stmt page(db_->get(), sql);
-  BindAll(page, binds, 1);
+  std::vector<std::pair<int64_t, double>> page_rows;
+  {
+    Stmt page(db_->get(), sql);
+    BindAll(page, binds, 1);
+    while (page.Step()) page_rows.push_back({page.Int(0), page.IsNull(1) ? 0 : -page.Double(1)});
+  }
   bool want_content = false;
   for (const std::string& f : q.fields) want_content = want_content || f == kContentField;
-  while (page.Step()) {
+  for (const auto& [rid, score] : page_rows) {
+    Stmt& row = Cached("SELECT doc_id, body, has_content FROM docs WHERE rid = ?");
+    row.Bind(1, rid);
+    if (!row.Step()) continue;
     SearchHit hit;
-    int64_t rid = page.Int(0);
-    hit.id = page.Text(1);
-    bool has_content = page.Int(3) != 0;
-    hit.score = page.IsNull(4) ? 0 : -page.Double(4);
-    hit.fields = Project(RowDocument(page.Text(2), want_content && has_content, rid), q.fields,
-                         want_content);
+    hit.id = row.Text(0);
+    std::string body = row.Text(1);
+    bool has_content = row.Int(2) != 0;
+    row.Reset();
+    hit.score = score;
+    hit.fields = Project(RowDocument(body, want_content && has_content, rid), q.fields, want_content);
     if (has_content) {
       if (!rank_expr.empty()) {
         Stmt& snip = Cached("SELECT snippet(fts, 1, ?, ?, '…', " + std::to_string(kSnippetTokens) +
