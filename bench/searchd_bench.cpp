@@ -41,7 +41,7 @@ using namespace vellis::searchd;
 
 constexpr char kIndex[] = "fileindex_bench";
 constexpr int kCompound = 500;
-constexpr int kQueries = 300;
+constexpr int kQueries = 500;
 
 std::string TempDir() {
   static std::string dir = [] {

@@ -34,7 +34,7 @@ constexpr int64_t kWalKeepBytes = 16LL * 1024 * 1024;
 // Reads through a memory map instead of read() calls (address space only).
 constexpr int64_t kMmapBytes = 256LL * 1024 * 1024;
 // The most matches that a search ranks by relevance (see Search).
-constexpr int64_t kMaxRankedMatches = 10000;
+constexpr int64_t kMaxRankedMatches = 5000;
 // Page cache per open index, in KiB.
 constexpr int kCacheKiB = 32 * 1024;
 

@@ -14,6 +14,7 @@ int main(int argc, char** argv) {
 
   vellis::cli::Context ctx;
   vellis::cli::AddQueueCommands(app, ctx);
+  vellis::cli::AddSearchCommands(app, ctx);
 
   try {
     app.parse(argc, argv);
