@@ -254,5 +254,57 @@ TEST_F(DaemonTest, SearchWhileTenThousandDocumentsAreWritten) {
   EXPECT_EQ(DocumentCount(), 10010);
 }
 
+struct CliResult {
+  int status;
+  std::string out;
+};
+
+// Runs the built `vellis` with `args` (shell words), stdout and stderr
+// together.
+CliResult RunVellis(const std::string& args) {
+  const char* dir = getenv("VELLIS_TEST_BINARY_DIR");
+  std::string bin = std::string(dir ? dir : ".") + "/tools/vellis/vellis";
+  FILE* p = popen((bin + " " + args + " 2>&1").c_str(), "r");
+  CliResult r{-1, ""};
+  if (!p) return r;
+  char buf[4096];
+  size_t n;
+  while ((n = fread(buf, 1, sizeof(buf), p)) > 0) r.out.append(buf, n);
+  int status = pclose(p);
+  r.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
+  return r;
+}
+
+TEST_F(DaemonTest, VellisSearchPrintsHitsWithSnippets) {
+  Ok(CreateRequest(kIndex, root_.Path("/volume1/@qoruindex")));
+  Json::Value pdf = FileDoc("/volume1/s/docs/plan.pdf");
+  pdf["QORUMDTextContent"] = "The budget plan for next year";
+  Json::Value song = FileDoc("/volume1/s/music/budget.mp3");
+  Ok(UpsertRequest(kIndex, pdf));
+  Ok(UpsertRequest(kIndex, song));
+
+  CliResult text = RunVellis("search budget --category document");
+  EXPECT_EQ(text.status, 0) << text.out;
+  EXPECT_EQ(text.out,
+            "/volume1/s/docs/plan.pdf\n"
+            "    The [budget] plan for next year\n"
+            "1 hit (1 shown)\n");
+
+  CliResult json = RunVellis("search budget --json --index " + std::string(kIndex));
+  EXPECT_EQ(json.status, 0) << json.out;
+  Json::Value answers = Parse(json.out);
+  ASSERT_EQ(answers.size(), 1u) << json.out;
+  EXPECT_EQ(answers[0]["total"].asInt(), 2);
+
+  CliResult unknown = RunVellis("search budget --index fileindex_none");
+  EXPECT_EQ(unknown.status, 1);
+  EXPECT_NE(unknown.out.find("error 1104: No index fileindex_none"), std::string::npos) << unknown.out;
+
+  Stop(SIGTERM);
+  CliResult down = RunVellis("search budget");
+  EXPECT_EQ(down.status, 1);
+  EXPECT_NE(down.out.find("error 913: Connect failed"), std::string::npos) << down.out;
+}
+
 }  // namespace
 }  // namespace vellis::searchd::testing
