@@ -36,6 +36,7 @@ struct IndexInfo {
   bool paused = false;
   int64_t documents = 0;
   int64_t disk_bytes = 0;  // the index's files in its folder
+  bool maintenance_pending = false;  // background upkeep still to do
 };
 
 struct TermCount {
@@ -95,6 +96,11 @@ class Engine {
                                               int64_t limit) = 0;
 
   virtual SearchResult Search(const std::string& id, const SearchQuery& query) = 0;
+
+  // One short step of background upkeep, run when no request is waiting
+  // (the SQLite engine merges full-text segments). Returns true while more
+  // work remains.
+  virtual bool Maintain() = 0;
 };
 
 }  // namespace vellis::searchd

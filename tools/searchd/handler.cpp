@@ -46,6 +46,7 @@ Json::Value InfoToJson(const IndexInfo& info, bool with_stats) {
   if (with_stats) {
     out["documents"] = static_cast<Json::Int64>(info.documents);
     out["disk_bytes"] = static_cast<Json::Int64>(info.disk_bytes);
+    out["merging"] = info.maintenance_pending;
   }
   return out;
 }
@@ -73,6 +74,16 @@ std::string Handler::HandleText(const std::string& request_text) {
 Json::Value Handler::Handle(const Json::Value& request) {
   std::lock_guard<std::mutex> lock(mu_);
   return Answer(request, false);
+}
+
+bool Handler::Idle() {
+  std::lock_guard<std::mutex> lock(mu_);
+  try {
+    return engine_.Maintain();
+  } catch (const std::exception& e) {
+    sdk::GetPlatform()->Syslog(LOG_WARNING, std::string("searchd: upkeep failed: ") + e.what());
+    return false;
+  }
 }
 
 Json::Value Handler::Answer(const Json::Value& request, bool nested) {

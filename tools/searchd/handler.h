@@ -31,6 +31,10 @@ class Handler {
   // Answers a parsed request. Never throws.
   Json::Value Handle(const Json::Value& request);
 
+  // Runs one step of the engine's background upkeep between requests.
+  // Returns true while more remains. Never throws (failures are logged).
+  bool Idle();
+
  private:
   // The one place where a failure becomes an error answer.
   Json::Value Answer(const Json::Value& request, bool nested);

@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <condition_variable>
 #include <cstring>
 #include <deque>
@@ -23,6 +24,8 @@ namespace vellis::searchd {
 namespace {
 
 constexpr int kListenBacklog = 128;
+// Quiet time before upkeep is looked at again when none was pending.
+constexpr int kIdleMs = 1000;
 
 [[noreturn]] void Fail(const std::string& step) {
   throw Error(kErrInternal, step + ": " + strerror(errno));
@@ -117,9 +120,22 @@ void Server::Run(int stop_fd, int workers) {
       }
     });
   }
+  bool merging = false;
   for (;;) {
     struct pollfd p[2] = {{listen_fd_, POLLIN, 0}, {stop_fd, POLLIN, 0}};
-    int n = poll(p, 2, -1);
+    // Upkeep runs in short steps after a quiet second without connections,
+    // then step after step while work remains and nobody connects.
+    int n = poll(p, 2, merging ? 0 : kIdleMs);
+    if (n == 0) {
+      bool idle;
+      {
+        std::lock_guard<std::mutex> lock(mu);
+        idle = pending.empty();
+      }
+      merging = idle && handler_.Idle();
+      continue;
+    }
+    merging = false;
     if (n < 0 && errno == EINTR) continue;
     if (n < 0 || (p[1].revents & (POLLIN | POLLHUP | POLLERR)) != 0) break;
     if ((p[0].revents & POLLIN) == 0) continue;

@@ -14,6 +14,10 @@ namespace {
 
 namespace fs = std::filesystem;
 
+// Pages written per index by one idle-time merge step: a few tens of
+// milliseconds, the longest a request waits for upkeep.
+constexpr int kMergePagesPerStep = 64;
+
 // SQLite's companion files of a WAL database.
 constexpr const char* kCompanions[] = {"", "-wal", "-shm"};
 
@@ -160,6 +164,7 @@ IndexInfo SqliteEngine::Stats(const std::string& id) {
   info.path = e.path;
   info.paused = e.paused;
   info.documents = Open(id).CountDocuments();
+  info.maintenance_pending = Open(id).merge_pending();
   std::string file = DbFile(e.path, id);
   for (const char* c : kCompanions) info.disk_bytes += FileSize(file + c);
   return info;
@@ -214,6 +219,15 @@ void SqliteEngine::UpdateTermSuggestion(const std::string& id, const std::string
 std::vector<TermCount> SqliteEngine::SuggestTerms(const std::string& id, const std::string& prefix,
                                                   int64_t limit) {
   return Open(id).SuggestTerms(prefix, limit);
+}
+
+bool SqliteEngine::Maintain() {
+  bool more = false;
+  for (auto& [id, index] : open_) {
+    if (registry_.Find(id) != nullptr && registry_.Find(id)->paused) continue;
+    if (index->Merge(kMergePagesPerStep)) more = true;
+  }
+  return more;
 }
 
 SearchResult SqliteEngine::Search(const std::string& id, const SearchQuery& query) {

@@ -47,6 +47,7 @@ class SqliteEngine : public Engine {
   std::vector<TermCount> SuggestTerms(const std::string& id, const std::string& prefix,
                                       int64_t limit) override;
   SearchResult Search(const std::string& id, const SearchQuery& query) override;
+  bool Maintain() override;
 
   // The database file of index `id` in `folder`.
   static std::string DbFile(const std::string& folder, const std::string& id);

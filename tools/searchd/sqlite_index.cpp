@@ -128,9 +128,13 @@ SqliteIndex::SqliteIndex(const std::string& file, const IndexSpec* spec)
                           FoldFunction, nullptr, nullptr);
   CreateTables();
   // Fewer, larger merges of full-text segments while documents stream in.
-  db_->Exec("INSERT INTO fts(fts, rank) VALUES ('automerge', " + std::to_string(kAutomerge) + ")");
-  db_->Exec("INSERT INTO fts_name(fts_name, rank) VALUES ('automerge', " +
-            std::to_string(kAutomerge) + ")");
+  // Idle-time merges (Merge) combine any two segments of a level.
+  for (const char* table : {"fts", "fts_name"}) {
+    std::string t = table;
+    db_->Exec("INSERT INTO " + t + "(" + t + ", rank) VALUES ('automerge', " +
+              std::to_string(kAutomerge) + ")");
+    db_->Exec("INSERT INTO " + t + "(" + t + ", rank) VALUES ('usermerge', 2)");
+  }
   Json::Value mappings;
   Stmt& get = Cached("SELECT value FROM meta WHERE key = 'mappings'");
   if (get.Step()) {
@@ -192,6 +196,7 @@ void SqliteIndex::CreateTables() {
 
 void SqliteIndex::BeginWrite() {
   if (sqlite3_get_autocommit(db_->get()) != 0) db_->Exec("BEGIN IMMEDIATE");
+  merge_pending_ = true;
 }
 
 template <typename Fn>
@@ -429,6 +434,26 @@ void SqliteIndex::Commit() {
                 "Writes since the previous commit were lost to a storage failure; "
                 "the later ones are committed");
   }
+}
+
+bool SqliteIndex::Merge(int pages) {
+  // Never inside the client's open transaction; after its commit.
+  if (sqlite3_get_autocommit(db_->get()) == 0) return false;
+  if (!merge_pending_) return false;
+  int64_t before = sqlite3_total_changes64(db_->get());
+  db_->Exec("BEGIN IMMEDIATE");
+  try {
+    db_->Exec("INSERT INTO fts(fts, rank) VALUES ('merge', " + std::to_string(pages) + ")");
+    db_->Exec("INSERT INTO fts_name(fts_name, rank) VALUES ('merge', " + std::to_string(pages) +
+              ")");
+    db_->Exec("COMMIT");
+  } catch (...) {
+    sqlite3_exec(db_->get(), "ROLLBACK", nullptr, nullptr, nullptr);
+    throw;
+  }
+  // FTS5 counts at least two changes for a merge that did work.
+  merge_pending_ = sqlite3_total_changes64(db_->get()) - before >= 2;
+  return merge_pending_;
 }
 
 int64_t SqliteIndex::CountDocuments() {

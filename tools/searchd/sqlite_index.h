@@ -54,6 +54,12 @@ class SqliteIndex {
   // failure (see above), having committed the writes made since.
   void Commit();
   int64_t CountDocuments();
+  // One step of idle-time upkeep: merges full-text segments, writing about
+  // `pages` pages, in a transaction of its own (nothing is done while
+  // writes are uncommitted). Fewer segments make searches faster. Returns
+  // true while there is more to merge now.
+  bool Merge(int pages);
+  bool merge_pending() const { return merge_pending_; }
   SearchResult Search(const SearchQuery& query);
   void UpdateTermSuggestion(const std::string& doc_id);
   std::vector<TermCount> SuggestTerms(const std::string& prefix, int64_t limit);
@@ -87,6 +93,8 @@ class SqliteIndex {
   std::map<std::string, std::unique_ptr<Stmt>> cache_;
   Schema schema_;
   bool lost_writes_ = false;
+  // Opened databases may hold unmerged segments from before.
+  bool merge_pending_ = true;
 };
 
 }  // namespace vellis::searchd
