@@ -440,20 +440,24 @@ bool SqliteIndex::Merge(int pages) {
   // Never inside the client's open transaction; after its commit.
   if (sqlite3_get_autocommit(db_->get()) == 0) return false;
   if (!merge_pending_) return false;
-  int64_t before = sqlite3_total_changes64(db_->get());
+  bool more = false;
   db_->Exec("BEGIN IMMEDIATE");
   try {
-    db_->Exec("INSERT INTO fts(fts, rank) VALUES ('merge', " + std::to_string(pages) + ")");
-    db_->Exec("INSERT INTO fts_name(fts_name, rank) VALUES ('merge', " + std::to_string(pages) +
-              ")");
+    for (const char* table : {"fts", "fts_name"}) {
+      std::string t = table;
+      int64_t before = sqlite3_total_changes64(db_->get());
+      db_->Exec("INSERT INTO " + t + "(" + t + ", rank) VALUES ('merge', " + std::to_string(pages) +
+                ")");
+      // FTS5 counts two or more changes for a merge that did work.
+      if (sqlite3_total_changes64(db_->get()) - before >= 2) more = true;
+    }
     db_->Exec("COMMIT");
   } catch (...) {
     sqlite3_exec(db_->get(), "ROLLBACK", nullptr, nullptr, nullptr);
     throw;
   }
-  // FTS5 counts at least two changes for a merge that did work.
-  merge_pending_ = sqlite3_total_changes64(db_->get()) - before >= 2;
-  return merge_pending_;
+  merge_pending_ = more;
+  return more;
 }
 
 int64_t SqliteIndex::CountDocuments() {

@@ -395,6 +395,36 @@ TEST_F(HandlerTest, BadRequestsAnswerACodeAndANamingMessage) {
       << "no bad request created an index";
 }
 
+TEST_F(HandlerTest, IdleUpkeepMergesAndKeepsEveryDocumentFindable) {
+  Ok(CreateRequest("s", db_dir_));
+  // Several commits leave several full-text segments behind.
+  for (int batch = 0; batch < 6; ++batch) {
+    Json::Value req(Json::objectValue);
+    for (int i = 0; i < 50; ++i) {
+      Json::Value doc = FileDoc("/v/s/" + std::to_string(batch) + "/f" + std::to_string(i) + ".txt");
+      doc["QORUMDTextContent"] = "common words batch" + std::to_string(batch);
+      req["compound"].append(UpsertRequest("s", doc));
+    }
+    EXPECT_FALSE(handler_.Handle(req)["has_fail"].asBool());
+    Ok(Request("commit", Data("s")));
+  }
+  EXPECT_TRUE(Ok(Request("index_stats", Data("s")))["merging"].asBool());
+  int steps = 0;
+  while (handler_.Idle() && steps < 1000) ++steps;
+  EXPECT_GT(steps, 0) << "six commits leave segments to merge";
+  EXPECT_LT(steps, 1000) << "upkeep ends";
+  EXPECT_FALSE(Ok(Request("index_stats", Data("s")))["merging"].asBool());
+  Json::Value search = Data("s");
+  search["query"] = "common";
+  EXPECT_EQ(Ok(Request("document_search", search))["total"].asInt(), 300);
+  search["query"] = "batch3";
+  EXPECT_EQ(Ok(Request("document_search", search))["total"].asInt(), 50);
+
+  Ok(UpsertRequest("s", FileDoc("/v/s/late.txt")));
+  EXPECT_FALSE(handler_.Idle()) << "no upkeep while writes are uncommitted";
+  EXPECT_TRUE(Ok(Request("index_stats", Data("s")))["merging"].asBool());
+}
+
 TEST_F(HandlerTest, TermSuggestionsFollowTheirDocuments) {
   Ok(CreateRequest("fileindex_s", db_dir_));
   Json::Value a = FileDoc("/v/s/Budget 2024.xlsx");
