@@ -119,8 +119,9 @@ Json::Value Handler::Run(const Json::Value& request, bool nested) {
     return out;
   }
   std::string command = RequireString(request, "request", "command");
-  Json::Value data(Json::objectValue);
-  if (request.isMember(kData)) data = RequireObject(request, "request", kData);
+  static const Json::Value kNoData(Json::objectValue);
+  const Json::Value& data =
+      request.isMember(kData) ? RequireObject(request, "request", kData) : kNoData;
   Json::Value out(Json::objectValue);
   out["success"] = true;
   out["data"] = Dispatch(command, data);

@@ -183,25 +183,27 @@ const FieldSpec& Schema::Spec(const std::string& field) const {
   return it == fields_.end() ? default_ : it->second;
 }
 
-Json::Value Schema::Normalize(const Json::Value& doc) const {
+Json::Value Schema::Normalize(Json::Value doc) const {
   if (!doc.isObject()) throw Error(kErrBadMember, "The document is not an object");
-  Json::Value out(Json::objectValue);
   for (const std::string& name : doc.getMemberNames()) {
-    Json::Value v = doc[name];
-    if (v.isNull()) continue;
+    Json::Value& v = doc[name];
+    if (v.isNull()) {
+      doc.removeMember(name);
+      continue;
+    }
     const FieldSpec& spec = Spec(name);
+    // FitType leaves the value as it was when it does not fit.
     if (!FitType(v, spec.type)) {
       throw Error(kErrFieldType, "Field " + name + " must be of type " + TypeName(spec.type) +
-                                     ", got " + JsonToString(doc[name]));
+                                     ", got " + JsonToString(v));
     }
-    out[name] = std::move(v);
   }
   for (const auto& [name, spec] : fields_) {
-    if (spec.required && !out.isMember(name)) {
+    if (spec.required && !doc.isMember(name)) {
       throw Error(kErrRequiredField, "Required field " + name + " is missing");
     }
   }
-  return out;
+  return doc;
 }
 
 IndexedForms Schema::Analyze(const Json::Value& doc) const {

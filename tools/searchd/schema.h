@@ -57,7 +57,7 @@ class Schema {
   // dropped. Throws Error kErrBadMember when `doc` is not an object,
   // kErrFieldType naming the field for a value that does not fit its type,
   // and kErrRequiredField naming the first missing required field.
-  Json::Value Normalize(const Json::Value& doc) const;
+  Json::Value Normalize(Json::Value doc) const;
 
   // The indexed forms of a normalised document.
   IndexedForms Analyze(const Json::Value& doc) const;

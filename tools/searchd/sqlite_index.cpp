@@ -2,6 +2,7 @@
 
 #include <cctype>
 #include <cstdlib>
+#include <cstring>
 #include <set>
 #include <variant>
 
@@ -247,25 +248,27 @@ void SqliteIndex::DeleteRow(int64_t rid) {
   Cached("DELETE FROM docs WHERE rid = ?").Bind(1, rid).Run();
 }
 
-void SqliteIndex::WriteRow(int64_t rid, const std::string& doc_id, const Json::Value& doc) {
-  IndexedForms forms = schema_.Analyze(doc);
+void SqliteIndex::WriteRow(int64_t rid, const std::string& doc_id, Json::Value doc) {
+  // Reads go through a const view: operator[] on the value itself would
+  // add the members it looks for.
+  const Json::Value& view = doc;
+  IndexedForms forms = schema_.Analyze(view);
   // The text content lives once, in the full-text table, when it is indexed
   // there whole; the row keeps the rest of the document.
-  Json::Value body = doc;
-  bool has_content = doc[kContentField].isString() && !forms.content.empty() &&
-                     forms.content == doc[kContentField].asString();
-  if (has_content) body.removeMember(kContentField);
+  const Json::Value* content = doc.find(kContentField, kContentField + strlen(kContentField));
+  bool has_content = content != nullptr && content->isString() && !forms.content.empty() &&
+                     forms.content == content->asString();
 
-  std::string name = doc[kNameField].isString() ? doc[kNameField].asString() : Basename(doc_id);
+  std::string name = view[kNameField].isString() ? view[kNameField].asString() : Basename(doc_id);
   std::string ext;
-  if (doc[kExtensionField].isString()) {
-    ext = LowerAscii(doc[kExtensionField].asString());
+  if (view[kExtensionField].isString()) {
+    ext = LowerAscii(view[kExtensionField].asString());
   } else if (size_t dot = name.rfind('.'); dot != std::string::npos) {
     ext = LowerAscii(name.substr(dot + 1));
   }
-  std::optional<int64_t> size = IntField(doc, kSizeField);
-  std::optional<int64_t> mtime = IntField(doc, kModifiedField);
-  if (!mtime) mtime = IntField(doc, kModifiedAltField);
+  std::optional<int64_t> size = IntField(view, kSizeField);
+  std::optional<int64_t> mtime = IntField(view, kModifiedField);
+  if (!mtime) mtime = IntField(view, kModifiedAltField);
 
   if (rid != 0) {
     Cached("DELETE FROM fts WHERE rowid = ?").Bind(1, rid).Run();
@@ -281,7 +284,8 @@ void SqliteIndex::WriteRow(int64_t rid, const std::string& doc_id, const Json::V
   } else {
     put.BindNull(1);
   }
-  put.Bind(2, doc_id).Bind(3, JsonToString(body)).Bind(4, static_cast<int64_t>(has_content));
+  if (has_content) doc.removeMember(kContentField);
+  put.Bind(2, doc_id).Bind(3, JsonToString(doc)).Bind(4, static_cast<int64_t>(has_content));
   put.Bind(5, name).Bind(6, ext);
   if (size) put.Bind(7, *size);
   if (mtime) put.Bind(8, *mtime);
@@ -303,7 +307,7 @@ void SqliteIndex::Upsert(const std::string& doc_id, const Json::Value& doc) {
   Json::Value normal = doc;
   const std::string& pid = schema_.property_id();
   if (normal.isObject() && !normal.isMember(pid)) normal[pid] = doc_id;
-  normal = schema_.Normalize(normal);
+  normal = schema_.Normalize(std::move(normal));
   if (ValueText(normal[pid]) != doc_id) {
     throw Error(kErrBadMember, "doc_id \"" + doc_id + "\" differs from the document's " + pid +
                                    " " + JsonToString(normal[pid]));
@@ -313,7 +317,7 @@ void SqliteIndex::Upsert(const std::string& doc_id, const Json::Value& doc) {
     find.Bind(1, doc_id);
     int64_t rid = find.Step() ? find.Int(0) : 0;
     find.Reset();
-    WriteRow(rid, doc_id, normal);
+    WriteRow(rid, doc_id, std::move(normal));
   });
 }
 
@@ -329,7 +333,7 @@ void SqliteIndex::Update(const std::string& doc_id, const Json::Value& fields) {
       merged[name] = fields[name];
     }
   }
-  merged = schema_.Normalize(merged);
+  merged = schema_.Normalize(std::move(merged));
   const std::string& pid = schema_.property_id();
   std::string new_id = ValueText(merged[pid]);
   if (new_id.empty()) throw Error(kErrBadMember, "The document's " + pid + " must not be empty");
@@ -343,7 +347,7 @@ void SqliteIndex::Update(const std::string& doc_id, const Json::Value& fields) {
       find.Reset();
       if (other != 0) DeleteRow(other);
     }
-    WriteRow(old->rid, new_id, merged);
+    WriteRow(old->rid, new_id, std::move(merged));
   });
 }
 

@@ -74,7 +74,7 @@ class SqliteIndex {
   void BeginWrite();
   std::optional<Stored> Load(const std::string& doc_id);
   // Writes `doc` (normalised) under `doc_id`, replacing row `rid` when not 0.
-  void WriteRow(int64_t rid, const std::string& doc_id, const Json::Value& doc);
+  void WriteRow(int64_t rid, const std::string& doc_id, Json::Value doc);
   void DeleteRow(int64_t rid);
   // Runs `fn` in the open write transaction; on a failure rolls the
   // transaction back and remembers the loss for Commit().
