@@ -60,8 +60,8 @@ const std::vector<std::string>& Vocabulary() {
   static std::vector<std::string> words = [] {
     std::vector<std::string> out;
     std::mt19937 rng(7);
-    const char* syllables[] = {"ka", "lo", "mi", "ren", "sto", "va", "ter", "un", "dis", "pra",
-                               "go", "li", "ne", "or", "que", "sa", "ti", "bel", "cor", "fu"};
+    const char* syllables[] = {"ka", "lo", "mi", "ren", "sto", "va", "ter", "un",  "dis", "pra",
+                               "go", "li", "ne", "or",  "que", "sa", "ti",  "bel", "cor", "fu"};
     for (int i = 0; i < 8000; ++i) {
       std::string w;
       int n = 2 + static_cast<int>(rng() % 3);
@@ -85,8 +85,8 @@ const char* kExtensions[] = {"pdf", "docx", "txt", "mp3", "jpg", "mkv", "xlsx", 
 Json::Value MakeDoc(int64_t i) {
   std::mt19937 rng(static_cast<uint32_t>(i * 2654435761u));
   Json::Value d(Json::objectValue);
-  std::string name = Word(rng) + "_" + Word(rng) + "_" + std::to_string(i) + "." +
-                     kExtensions[i % 8];
+  std::string name =
+      Word(rng) + "_" + Word(rng) + "_" + std::to_string(i) + "." + kExtensions[i % 8];
   std::string dir = "/volume1/share/d" + std::to_string(i / 1000) + "/s" + std::to_string(i % 37);
   d["QORUMDPath"] = dir + "/" + name;
   d["QORUMDFSName"] = name;
@@ -253,11 +253,12 @@ void BM_BareSqlite(benchmark::State& state) {
   std::string file = TempDir() + "/bare.sqlite";
   sqlite3* db = nullptr;
   sqlite3_open(file.c_str(), &db);
-  sqlite3_exec(db,
-               "PRAGMA journal_mode=WAL; PRAGMA synchronous=FULL;"
-               "CREATE TABLE IF NOT EXISTS docs(rid INTEGER PRIMARY KEY, doc_id TEXT UNIQUE, body TEXT);"
-               "CREATE VIRTUAL TABLE IF NOT EXISTS fts USING fts5(content);",
-               nullptr, nullptr, nullptr);
+  sqlite3_exec(
+      db,
+      "PRAGMA journal_mode=WAL; PRAGMA synchronous=FULL;"
+      "CREATE TABLE IF NOT EXISTS docs(rid INTEGER PRIMARY KEY, doc_id TEXT UNIQUE, body TEXT);"
+      "CREATE VIRTUAL TABLE IF NOT EXISTS fts USING fts5(content);",
+      nullptr, nullptr, nullptr);
   sqlite3_stmt* doc_st = nullptr;
   sqlite3_stmt* fts_st = nullptr;
   sqlite3_prepare_v2(db, "INSERT INTO docs(doc_id, body) VALUES (?, ?)", -1, &doc_st, nullptr);
@@ -297,8 +298,14 @@ void BM_BareSqlite(benchmark::State& state) {
 // wall time. Bare SQLite runs first, before the daemon exists, so that none
 // of the daemon's idle-time merging falls into its measurement.
 BENCHMARK(BM_BareSqlite)->Unit(benchmark::kMillisecond)->Iterations(40)->MeasureProcessCPUTime();
-BENCHMARK(BM_UpsertOneEach)->Unit(benchmark::kMicrosecond)->Iterations(2000)->MeasureProcessCPUTime();
-BENCHMARK(BM_UpsertCompound500)->Unit(benchmark::kMillisecond)->Iterations(40)->MeasureProcessCPUTime();
+BENCHMARK(BM_UpsertOneEach)
+    ->Unit(benchmark::kMicrosecond)
+    ->Iterations(2000)
+    ->MeasureProcessCPUTime();
+BENCHMARK(BM_UpsertCompound500)
+    ->Unit(benchmark::kMillisecond)
+    ->Iterations(40)
+    ->MeasureProcessCPUTime();
 
 // Keeps the rates so that main() can print the ratio.
 class RateReporter : public benchmark::ConsoleReporter {
@@ -345,9 +352,10 @@ void MeasureSearch(int64_t target) {
     stats = d.Call(Request("index_stats", stats_req));
   }
   double merge_s = std::chrono::duration<double>(std::chrono::steady_clock::now() - m0).count();
-  printf("\nIndex: %lld documents, %.1f MB on disk (filled in %.1f s, merged when idle in %.1f s)\n",
-         static_cast<long long>(stats["documents"].asInt64()),
-         static_cast<double>(stats["disk_bytes"].asInt64()) / 1e6, build_s, merge_s);
+  printf(
+      "\nIndex: %lld documents, %.1f MB on disk (filled in %.1f s, merged when idle in %.1f s)\n",
+      static_cast<long long>(stats["documents"].asInt64()),
+      static_cast<double>(stats["disk_bytes"].asInt64()) / 1e6, build_s, merge_s);
 
   std::mt19937 rng(99);
   for (const char* kind : {"word", "name"}) {
@@ -366,12 +374,16 @@ void MeasureSearch(int64_t target) {
       data["limit"] = 20;
       auto start = std::chrono::steady_clock::now();
       Json::Value answer = d.Call(Request("document_search", data));
-      ms.push_back(std::chrono::duration<double, std::milli>(std::chrono::steady_clock::now() - start).count());
+      ms.push_back(
+          std::chrono::duration<double, std::milli>(std::chrono::steady_clock::now() - start)
+              .count());
       hits += answer["total"].asInt64();
     }
-    printf("search %-4s: median %.2f ms, p99 %.2f ms, mean total hits %.0f (%d queries, 20 per page)\n",
-           kind, Percentile(ms, 0.5), Percentile(ms, 0.99), static_cast<double>(hits) / kQueries,
-           kQueries);
+    printf(
+        "search %-4s: median %.2f ms, p99 %.2f ms, mean total hits %.0f (%d queries, 20 per "
+        "page)\n",
+        kind, Percentile(ms, 0.5), Percentile(ms, 0.99), static_cast<double>(hits) / kQueries,
+        kQueries);
   }
 }
 
@@ -385,8 +397,8 @@ int main(int argc, char** argv) {
   double compound = g_rate["BM_UpsertCompound500/iterations:40/process_time"];
   double bare = g_rate["BM_BareSqlite/iterations:40/process_time"];
   if (bare > 0) {
-    printf("\nUpserts per second: one per request %.0f, compound of %d %.0f, bare SQLite %.0f\n", one,
-           kCompound, compound, bare);
+    printf("\nUpserts per second: one per request %.0f, compound of %d %.0f, bare SQLite %.0f\n",
+           one, kCompound, compound, bare);
     printf("compound / bare SQLite = %.2f (target >= 0.5); one each / bare = %.2f\n",
            compound / bare, one / bare);
   }

@@ -28,13 +28,15 @@ std::optional<std::string> OptionalString(const Json::Value& obj, const std::str
   return obj[key].asString();
 }
 
-const Json::Value& RequireObject(const Json::Value& obj, const std::string& where, const char* key) {
+const Json::Value& RequireObject(const Json::Value& obj, const std::string& where,
+                                 const char* key) {
   if (!obj.isMember(key)) Bad(where, key, "is missing");
   if (!obj[key].isObject()) Bad(where, key, "must be an object");
   return obj[key];
 }
 
-std::optional<int64_t> OptionalInt(const Json::Value& obj, const std::string& where, const char* key) {
+std::optional<int64_t> OptionalInt(const Json::Value& obj, const std::string& where,
+                                   const char* key) {
   if (!obj.isMember(key)) return std::nullopt;
   const Json::Value& v = obj[key];
   if (v.isBool() || !v.isInt64()) Bad(where, key, "must be an integer");

@@ -20,7 +20,8 @@ std::optional<std::string> OptionalString(const Json::Value& obj, const std::str
                                           const char* key);
 // `obj`[key], which must be an object.
 const Json::Value& RequireObject(const Json::Value& obj, const std::string& where, const char* key);
-std::optional<int64_t> OptionalInt(const Json::Value& obj, const std::string& where, const char* key);
+std::optional<int64_t> OptionalInt(const Json::Value& obj, const std::string& where,
+                                   const char* key);
 // A string or an array of strings, as a list; empty when absent.
 std::vector<std::string> StringList(const Json::Value& obj, const std::string& where,
                                     const char* key);

@@ -35,7 +35,7 @@ struct IndexInfo {
   std::string path;
   bool paused = false;
   int64_t documents = 0;
-  int64_t disk_bytes = 0;  // the index's files in its folder
+  int64_t disk_bytes = 0;            // the index's files in its folder
   bool maintenance_pending = false;  // background upkeep still to do
 };
 
@@ -85,7 +85,8 @@ class Engine {
                                   const std::vector<std::string>& load_fields) = 0;
   // Makes the index's writes so far durable.
   virtual void Commit(const std::string& id) = 0;
-  // Commits every index (on a clean stop).
+  // Commits every index (on a clean stop), all of them even when one fails;
+  // then throws naming those that failed.
   virtual void CommitAll() = 0;
 
   // Records the suggestion terms of one document, replacing its earlier

@@ -58,8 +58,7 @@ std::string ExchangeText(const std::string& socket_path, const std::string& requ
   return answer;
 }
 
-Json::Value Exchange(const std::string& socket_path, const Json::Value& request,
-                     int timeout_ms) {
+Json::Value Exchange(const std::string& socket_path, const Json::Value& request, int timeout_ms) {
   std::string text = ExchangeText(socket_path, JsonToString(request), timeout_ms);
   Json::Value answer;
   if (!JsonFromString(answer, text) || !answer.isObject() || !answer["success"].isBool()) {

@@ -83,7 +83,8 @@ FrameStatus ReadFrame(int fd, std::string& out, int timeout_ms) {
   int64_t deadline = NowMs() + timeout_ms;
   uint32_t length = 0;
   bool got_any = false;
-  FrameStatus st = RecvAll(fd, reinterpret_cast<char*>(&length), sizeof(length), deadline, &got_any);
+  FrameStatus st =
+      RecvAll(fd, reinterpret_cast<char*>(&length), sizeof(length), deadline, &got_any);
   if (st != FrameStatus::kOk) return st;
   if (length == 0 || length > kMaxMessageBytes) return FrameStatus::kBadLength;
   // The buffer grows with the bytes that actually arrive, so a large length
@@ -108,8 +109,7 @@ FrameStatus WriteFrame(int fd, const std::string& message, int timeout_ms) {
   if (message.empty() || message.size() > kMaxMessageBytes) return FrameStatus::kBadLength;
   int64_t deadline = NowMs() + timeout_ms;
   uint32_t length = static_cast<uint32_t>(message.size());
-  FrameStatus st =
-      SendAll(fd, reinterpret_cast<const char*>(&length), sizeof(length), deadline);
+  FrameStatus st = SendAll(fd, reinterpret_cast<const char*>(&length), sizeof(length), deadline);
   if (st != FrameStatus::kOk) return st;
   return SendAll(fd, message.data(), message.size(), deadline);
 }

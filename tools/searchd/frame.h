@@ -29,10 +29,10 @@ inline constexpr int kSendTimeoutMs = 30 * 1000;
 
 enum class FrameStatus {
   kOk,
-  kClosed,      // end of stream before the first byte of the length
-  kTruncated,   // end of stream or socket error inside the frame
-  kBadLength,   // a length of 0 or above kMaxMessageBytes
-  kTimeout,     // the deadline passed
+  kClosed,     // end of stream before the first byte of the length
+  kTruncated,  // end of stream or socket error inside the frame
+  kBadLength,  // a length of 0 or above kMaxMessageBytes
+  kTimeout,    // the deadline passed
 };
 
 // A short English text for logs and errors ("length 0 refused", ...).

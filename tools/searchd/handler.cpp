@@ -91,8 +91,9 @@ Json::Value Handler::Answer(const Json::Value& request, bool nested) {
     return Run(request, nested);
   } catch (const Error& e) {
     if (!IsBusyCode(e.GetCode())) {
-      sdk::GetPlatform()->Syslog(LOG_WARNING, "searchd: request failed: code=" +
-                                                  std::to_string(e.GetCode()) + ", reason=" + e.what());
+      sdk::GetPlatform()->Syslog(
+          LOG_WARNING,
+          "searchd: request failed: code=" + std::to_string(e.GetCode()) + ", reason=" + e.what());
     }
     return ErrorAnswer(e.GetCode(), e.what());
   } catch (const std::exception& e) {

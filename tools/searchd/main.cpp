@@ -28,7 +28,9 @@ namespace {
 
 constexpr int kDefaultWorkers = 4;
 
-void Log(int priority, const std::string& text) { vellis::sdk::GetPlatform()->Syslog(priority, text); }
+void Log(int priority, const std::string& text) {
+  vellis::sdk::GetPlatform()->Syslog(priority, text);
+}
 
 int Serve(int workers, int recv_timeout_ms) {
   using namespace vellis::searchd;
@@ -42,7 +44,8 @@ int Serve(int workers, int recv_timeout_ms) {
   int stop_fd = signalfd(-1, &stop, SFD_CLOEXEC);
   if (stop_fd < 0) throw vellis::Error(vellis::kErrInternal, "signalfd failed");
 
-  std::filesystem::create_directories(std::filesystem::path(vellis::RootPath(kPidFilePath)).parent_path());
+  std::filesystem::create_directories(
+      std::filesystem::path(vellis::RootPath(kPidFilePath)).parent_path());
   PidFile pid_file(vellis::RootPath(kPidFilePath));
   SqliteEngine engine(vellis::RootPath(kRegistryPath));
   Handler handler(engine);
@@ -51,10 +54,16 @@ int Serve(int workers, int recv_timeout_ms) {
   server.Listen();
   Log(LOG_INFO, "searchd: listening on " + vellis::RootPath(kSocketPath));
   server.Run(stop_fd, workers);
-  engine.CommitAll();
+  int status = 0;
+  try {
+    engine.CommitAll();
+  } catch (const vellis::Error& e) {
+    Log(LOG_ERR, std::string("searchd: ") + e.what());
+    status = 1;
+  }
   Log(LOG_INFO, "searchd: stopped");
   close(stop_fd);
-  return 0;
+  return status;
 }
 
 }  // namespace
@@ -77,7 +86,8 @@ int main(int argc, char** argv) {
     if (!foreground) vellis::searchd::Daemonize();
     return Serve(workers, recv_timeout_ms);
   } catch (const vellis::Error& e) {
-    Log(LOG_ERR, "searchd: cannot run: code=" + std::to_string(e.GetCode()) + ", reason=" + e.what());
+    Log(LOG_ERR,
+        "searchd: cannot run: code=" + std::to_string(e.GetCode()) + ", reason=" + e.what());
   } catch (const std::exception& e) {
     Log(LOG_ERR, std::string("searchd: cannot run: ") + e.what());
   }

@@ -28,7 +28,8 @@ void CheckIndexId(const std::string& id) {
     throw Error(kErrBadIndexId, "Bad index id \"" + Printable(id) + "\": " + why);
   };
   if (id.empty()) bad("empty");
-  if (id.size() > kMaxIndexIdBytes) bad("longer than " + std::to_string(kMaxIndexIdBytes) + " bytes");
+  if (id.size() > kMaxIndexIdBytes)
+    bad("longer than " + std::to_string(kMaxIndexIdBytes) + " bytes");
   if (id == "." || id == "..") bad("\".\" and \"..\" are not names");
   for (unsigned char c : id) {
     if (c == '/') bad("contains \"/\"");

@@ -35,7 +35,8 @@ PidFile::PidFile(std::string path) : path_(std::move(path)) {
     throw Error(kErrLock, "Another vellis-searchd holds " + path_);
   }
   std::string text = std::to_string(getpid()) + "\n";
-  if (ftruncate(fd_, 0) != 0 || write(fd_, text.data(), text.size()) != static_cast<ssize_t>(text.size())) {
+  if (ftruncate(fd_, 0) != 0 ||
+      write(fd_, text.data(), text.size()) != static_cast<ssize_t>(text.size())) {
     throw Error(kErrInternal, "write " + path_ + ": " + strerror(errno));
   }
 }

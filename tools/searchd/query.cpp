@@ -5,7 +5,9 @@
 namespace vellis::searchd {
 namespace {
 
-bool IsBlank(char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\n' || c == '\f' || c == '\v'; }
+bool IsBlank(char c) {
+  return c == ' ' || c == '\t' || c == '\r' || c == '\n' || c == '\f' || c == '\v';
+}
 
 bool IsFieldChar(char c, bool first) {
   unsigned char u = static_cast<unsigned char>(c);

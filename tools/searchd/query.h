@@ -2,12 +2,12 @@
 // text. docs/search.md describes the request members that fill it.
 #pragma once
 
+#include <json/json.h>
+
 #include <cstdint>
 #include <optional>
 #include <string>
 #include <vector>
-
-#include <json/json.h>
 
 namespace vellis::searchd {
 

@@ -20,7 +20,8 @@ Registry::Registry(std::string file) : file_(std::move(file)) {
   const Json::Value& list = root["indexes"];
   for (const std::string& id : list.getMemberNames()) {
     const Json::Value& e = list[id];
-    if (!e["path"].isString()) throw Error(kErrStorage, "Index registry entry " + id + " lacks a path");
+    if (!e["path"].isString())
+      throw Error(kErrStorage, "Index registry entry " + id + " lacks a path");
     entries_[id] = RegistryEntry{e["path"].asString(), e["paused"].asBool()};
   }
 }

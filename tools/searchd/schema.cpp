@@ -49,7 +49,8 @@ FieldSpec ParseSpec(const Json::Value& obj, const FieldSpec& base, const std::st
   }
   for (const char* flag : {"required", "stored", "_all"}) {
     if (!obj.isMember(flag)) continue;
-    if (!obj[flag].isBool()) BadMappings(std::string("\"") + flag + "\" of \"" + name + "\" is not a bool");
+    if (!obj[flag].isBool())
+      BadMappings(std::string("\"") + flag + "\" of \"" + name + "\" is not a bool");
     bool value = obj[flag].asBool();
     if (flag[0] == 'r') spec.required = value;
     if (flag[0] == 's') spec.stored = value;
@@ -239,7 +240,8 @@ IndexedForms Schema::Analyze(const Json::Value& doc) const {
     if (name == kContentField) {
       Append(forms.content, text);
     } else if (spec.analyzer == Analyzer::kWhiteSpace) {
-      for (const std::string& token : SplitBlanks(text)) Append(forms.ws_all, HexToken(FoldCase(token)));
+      for (const std::string& token : SplitBlanks(text))
+        Append(forms.ws_all, HexToken(FoldCase(token)));
     } else {
       Append(forms.std_all, text);
     }

@@ -39,7 +39,8 @@ SearchQuery ParseSearchRequest(const Json::Value& data) {
   } else if (sort == "modified") {
     q.sort = SortKey::kModified;
   } else {
-    throw Error(kErrBadQuery, "Unknown sort key \"" + sort + "\" (relevance, name, size, modified)");
+    throw Error(kErrBadQuery,
+                "Unknown sort key \"" + sort + "\" (relevance, name, size, modified)");
   }
   std::string order = OptionalString(data, w, "order").value_or("asc");
   if (order != "asc" && order != "desc") {

@@ -80,12 +80,12 @@ void Server::ServeConnection(int fd) {
     std::string answer = handler_.HandleText(request);
     st = WriteFrame(fd, answer);
     if (st != FrameStatus::kOk) {
-      sdk::GetPlatform()->Syslog(LOG_WARNING, std::string("searchd: answer not delivered: ") +
-                                                  FrameStatusText(st));
+      sdk::GetPlatform()->Syslog(
+          LOG_WARNING, std::string("searchd: answer not delivered: ") + FrameStatusText(st));
     }
   } else if (st != FrameStatus::kClosed) {
-    sdk::GetPlatform()->Syslog(LOG_WARNING, std::string("searchd: request dropped: ") +
-                                                FrameStatusText(st));
+    sdk::GetPlatform()->Syslog(LOG_WARNING,
+                               std::string("searchd: request dropped: ") + FrameStatusText(st));
   }
   close(fd);
 }

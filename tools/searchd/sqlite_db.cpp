@@ -9,8 +9,8 @@ void ThrowSqlite(sqlite3* db, int rc, const std::string& what) {
   std::string msg = what + ": " + (db ? sqlite3_errmsg(db) : sqlite3_errstr(rc));
   int primary = rc & 0xff;
   if (primary == SQLITE_BUSY || primary == SQLITE_LOCKED) {
-    throw Error(kErrBusyLocked, "Index database is locked by another process, retry later (" +
-                                    msg + ")");
+    throw Error(kErrBusyLocked,
+                "Index database is locked by another process, retry later (" + msg + ")");
   }
   throw Error(kErrStorage, "Storage failure: " + msg);
 }

@@ -182,7 +182,8 @@ std::vector<IndexInfo> SqliteEngine::ListIndexes() {
   return out;
 }
 
-void SqliteEngine::Upsert(const std::string& id, const std::string& doc_id, const Json::Value& doc) {
+void SqliteEngine::Upsert(const std::string& id, const std::string& doc_id,
+                          const Json::Value& doc) {
   OpenForWrite(id).Upsert(doc_id, doc);
 }
 
@@ -209,7 +210,16 @@ Json::Value SqliteEngine::GetByPrefix(const std::string& id, const std::string& 
 void SqliteEngine::Commit(const std::string& id) { Open(id).Commit(); }
 
 void SqliteEngine::CommitAll() {
-  for (auto& [id, index] : open_) index->Commit();
+  // One index failing must not keep the others from committing.
+  std::string failed;
+  for (auto& [id, index] : open_) {
+    try {
+      index->Commit();
+    } catch (const Error& e) {
+      failed += (failed.empty() ? "" : "; ") + id + ": " + e.what();
+    }
+  }
+  if (!failed.empty()) throw Error(kErrStorage, "Commit failed for " + failed);
 }
 
 void SqliteEngine::UpdateTermSuggestion(const std::string& id, const std::string& doc_id) {

@@ -108,7 +108,6 @@ std::string CatchAllExpr(const QueryTerm& t) {
   return expr;
 }
 
-
 }  // namespace
 
 SqliteIndex::SqliteIndex(const std::string& file, const IndexSpec* spec)
@@ -150,9 +149,10 @@ SqliteIndex::SqliteIndex(const std::string& file, const IndexSpec* spec)
     mappings = spec->mappings;
     schema_ = Schema::FromMappings(mappings);
     Stmt put(db_->get(), "INSERT INTO meta(key, value) VALUES (?, ?)");
-    for (const auto& [key, value] : {std::pair<const char*, const Json::Value*>{"mappings", &spec->mappings},
-                                     {"settings", &spec->settings},
-                                     {"event_handler", &spec->event_handler}}) {
+    for (const auto& [key, value] :
+         {std::pair<const char*, const Json::Value*>{"mappings", &spec->mappings},
+          {"settings", &spec->settings},
+          {"event_handler", &spec->event_handler}}) {
       put.Bind(1, std::string(key)).Bind(2, JsonToString(*value)).Run();
       put.Reset();
     }
@@ -163,7 +163,8 @@ SqliteIndex::SqliteIndex(const std::string& file, const IndexSpec* spec)
 
 SqliteIndex::~SqliteIndex() {
   cache_.clear();
-  if (sqlite3_get_autocommit(db_->get()) == 0) sqlite3_exec(db_->get(), "ROLLBACK", nullptr, nullptr, nullptr);
+  if (sqlite3_get_autocommit(db_->get()) == 0)
+    sqlite3_exec(db_->get(), "ROLLBACK", nullptr, nullptr, nullptr);
 }
 
 Stmt& SqliteIndex::Cached(const std::string& sql) {
@@ -299,7 +300,10 @@ void SqliteIndex::WriteRow(int64_t rid, const std::string& doc_id, Json::Value d
       .Bind(5, forms.kw)
       .Run();
   if (!forms.name.empty()) {
-    Cached("INSERT INTO fts_name(rowid, name) VALUES (?, ?)").Bind(1, rid).Bind(2, forms.name).Run();
+    Cached("INSERT INTO fts_name(rowid, name) VALUES (?, ?)")
+        .Bind(1, rid)
+        .Bind(2, forms.name)
+        .Run();
   }
 }
 
@@ -361,8 +365,9 @@ bool SqliteIndex::Delete(const std::string& doc_id) {
     if (rid == 0) return;
     found = true;
     DeleteRow(rid);
-    Cached("UPDATE suggest SET docs = docs - 1 WHERE term IN"
-           " (SELECT term FROM suggest_doc WHERE doc_id = ?)")
+    Cached(
+        "UPDATE suggest SET docs = docs - 1 WHERE term IN"
+        " (SELECT term FROM suggest_doc WHERE doc_id = ?)")
         .Bind(1, doc_id)
         .Run();
     Cached("DELETE FROM suggest WHERE docs <= 0").Run();
@@ -384,7 +389,10 @@ int64_t SqliteIndex::DeleteByPrefix(const std::string& field, const std::string&
   Atomically([&] {
     const char* range = " (SELECT rid FROM docs WHERE doc_id >= ? AND doc_id < ?)";
     std::string upper = PrefixUpperBound(prefix);
-    Cached(std::string("DELETE FROM fts WHERE rowid IN") + range).Bind(1, prefix).Bind(2, upper).Run();
+    Cached(std::string("DELETE FROM fts WHERE rowid IN") + range)
+        .Bind(1, prefix)
+        .Bind(2, upper)
+        .Run();
     Cached(std::string("DELETE FROM fts_name WHERE rowid IN") + range)
         .Bind(1, prefix)
         .Bind(2, upper)
@@ -420,8 +428,9 @@ Json::Value SqliteIndex::GetByPrefix(const std::string& field, const std::string
   Json::Value out(Json::arrayValue);
   bool want_content = load_fields.empty();
   for (const std::string& f : load_fields) want_content = want_content || f == kContentField;
-  Stmt st(db_->get(),
-          "SELECT rid, body, has_content FROM docs WHERE doc_id >= ? AND doc_id < ? ORDER BY doc_id");
+  Stmt st(
+      db_->get(),
+      "SELECT rid, body, has_content FROM docs WHERE doc_id >= ? AND doc_id < ? ORDER BY doc_id");
   st.Bind(1, prefix).Bind(2, PrefixUpperBound(prefix));
   while (st.Step()) {
     Json::Value doc = RowDocument(st.Text(1), want_content && st.Int(2) != 0, st.Int(0));
@@ -534,7 +543,8 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
   if (!q.name.empty()) {
     std::string folded = FoldCase(q.name);
     if (CodePointCount(folded) >= 3) {
-      sets.push_back({"SELECT rowid AS r FROM fts_name WHERE fts_name MATCH ?", {FtsQuote(folded)}});
+      sets.push_back(
+          {"SELECT rowid AS r FROM fts_name WHERE fts_name MATCH ?", {FtsQuote(folded)}});
     } else {
       // Too short for trigrams: a scan of the names.
       where.Add("instr(fold(name), ?) > 0", {folded});
@@ -639,8 +649,8 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
     sql = std::string("SELECT r, ") + (scored ? "score" : "NULL") + " FROM (" + candidates(scored) +
           ")";
   } else {
-    sql = std::string("SELECT rid AS r, ") + (scored ? "score" : "NULL") + " FROM " +
-          from(scored) + " WHERE 1" + where.sql;
+    sql = std::string("SELECT rid AS r, ") + (scored ? "score" : "NULL") + " FROM " + from(scored) +
+          " WHERE 1" + where.sql;
   }
   sql += " ORDER BY " + order + " LIMIT ? OFFSET ?";
   std::vector<Bound> binds = cand_binds;
@@ -665,7 +675,8 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
     bool has_content = row.Int(2) != 0;
     row.Reset();
     hit.score = score;
-    hit.fields = Project(RowDocument(body, want_content && has_content, rid), q.fields, want_content);
+    hit.fields =
+        Project(RowDocument(body, want_content && has_content, rid), q.fields, want_content);
     if (has_content) {
       if (!rank_expr.empty()) {
         Stmt& snip = Cached("SELECT snippet(fts, 1, ?, ?, '…', " + std::to_string(kSnippetTokens) +
@@ -700,15 +711,20 @@ void SqliteIndex::UpdateTermSuggestion(const std::string& doc_id) {
     if (CodePointCount(w) >= 2) terms.insert(w);
   }
   Atomically([&] {
-    Cached("UPDATE suggest SET docs = docs - 1 WHERE term IN"
-           " (SELECT term FROM suggest_doc WHERE doc_id = ?)")
+    Cached(
+        "UPDATE suggest SET docs = docs - 1 WHERE term IN"
+        " (SELECT term FROM suggest_doc WHERE doc_id = ?)")
         .Bind(1, doc_id)
         .Run();
     Cached("DELETE FROM suggest_doc WHERE doc_id = ?").Bind(1, doc_id).Run();
     for (const std::string& term : terms) {
-      Cached("INSERT INTO suggest_doc(doc_id, term) VALUES (?, ?)").Bind(1, doc_id).Bind(2, term).Run();
-      Cached("INSERT INTO suggest(term, docs) VALUES (?, 1)"
-             " ON CONFLICT(term) DO UPDATE SET docs = docs + 1")
+      Cached("INSERT INTO suggest_doc(doc_id, term) VALUES (?, ?)")
+          .Bind(1, doc_id)
+          .Bind(2, term)
+          .Run();
+      Cached(
+          "INSERT INTO suggest(term, docs) VALUES (?, 1)"
+          " ON CONFLICT(term) DO UPDATE SET docs = docs + 1")
           .Bind(1, term)
           .Run();
     }

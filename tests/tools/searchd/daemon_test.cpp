@@ -93,8 +93,8 @@ class DaemonTest : public ::testing::Test {
   Json::Value Call(const Json::Value& request) { return Exchange(socket_, request); }
   Json::Value Ok(const Json::Value& request) {
     Json::Value answer = Call(request);
-    EXPECT_TRUE(answer["success"].asBool()) << JsonToString(request).substr(0, 300) << " -> "
-                                            << JsonToString(answer);
+    EXPECT_TRUE(answer["success"].asBool())
+        << JsonToString(request).substr(0, 300) << " -> " << JsonToString(answer);
     return answer["data"];
   }
   Json::Value Data() {
@@ -168,7 +168,8 @@ TEST_F(DaemonTest, BadFramesAreDroppedWithoutAnAnswer) {
 }
 
 TEST_F(DaemonTest, TextThatIsNotARequestIsAnsweredWithAnError) {
-  const std::string texts[] = {"hello", "{\"command\": \"index_list\"} x", "{\"command\": \"index_list\"}\n\n{}",
+  const std::string texts[] = {"hello", "{\"command\": \"index_list\"} x",
+                               "{\"command\": \"index_list\"}\n\n{}",
                                std::string("{\"command\": \"index_list\"}\0", 26), "\xff\xfe{}"};
   for (const std::string& text : texts) {
     Json::Value answer = Parse(ExchangeText(socket_, text));
@@ -224,7 +225,8 @@ TEST_F(DaemonTest, SearchWhileTenThousandDocumentsAreWritten) {
     for (int batch = 0; batch < 20; ++batch) {
       Json::Value req(Json::objectValue);
       for (int i = 0; i < 500; ++i) {
-        Json::Value doc = FileDoc("/v/s/bulk/" + std::to_string(batch) + "/f" + std::to_string(i) + ".txt");
+        Json::Value doc =
+            FileDoc("/v/s/bulk/" + std::to_string(batch) + "/f" + std::to_string(i) + ".txt");
         doc["QORUMDTextContent"] = "haystack straw number " + std::to_string(batch * 500 + i);
         req["compound"].append(UpsertRequest(kIndex, doc));
       }
@@ -298,7 +300,8 @@ TEST_F(DaemonTest, VellisSearchPrintsHitsWithSnippets) {
 
   CliResult unknown = RunVellis("search budget --index fileindex_none");
   EXPECT_EQ(unknown.status, 1);
-  EXPECT_NE(unknown.out.find("error 1104: No index fileindex_none"), std::string::npos) << unknown.out;
+  EXPECT_NE(unknown.out.find("error 1104: No index fileindex_none"), std::string::npos)
+      << unknown.out;
 
   Stop(SIGTERM);
   CliResult down = RunVellis("search budget");

@@ -129,8 +129,8 @@ TEST_F(HandlerTest, RenameOfADirectoryWithAThousandDocuments) {
   batch["compound"] = Json::Value(Json::arrayValue);
   batch["compound"].append(UpsertRequest("s", FileDoc("/volume1/s/a")));
   for (int i = 0; i < 1000; ++i) {
-    batch["compound"].append(
-        UpsertRequest("s", FileDoc("/volume1/s/a/d" + std::to_string(i % 10) + "/f" + std::to_string(i) + ".txt")));
+    batch["compound"].append(UpsertRequest("s", FileDoc("/volume1/s/a/d" + std::to_string(i % 10) +
+                                                        "/f" + std::to_string(i) + ".txt")));
   }
   batch["compound"].append(UpsertRequest("s", FileDoc("/volume1/s/ab/keep.txt")));
   EXPECT_FALSE(Ok(batch).isNull());
@@ -201,7 +201,8 @@ TEST_F(HandlerTest, GetByQueryLoadsOnlyTheNamedFields) {
   q["load_field"].append("QORUMDNoSuchField");
   Json::Value docs = Ok(Request("document_get_by_query", q));
   ASSERT_EQ(docs.size(), 1u);
-  EXPECT_EQ(docs[0].getMemberNames(), (std::vector<std::string>{"QORUMDPath", "QORUMDTextContent"}));
+  EXPECT_EQ(docs[0].getMemberNames(),
+            (std::vector<std::string>{"QORUMDPath", "QORUMDTextContent"}));
   EXPECT_EQ(docs[0]["QORUMDTextContent"].asString(), "some words");
 }
 
@@ -237,7 +238,8 @@ TEST_F(HandlerTest, RenameAndMigrateMoveTheIndexFiles) {
   EXPECT_EQ(FailCode(Request("index_stats", Data("fileindex_old"))), 1104);
   EXPECT_FALSE(FileExists(db_dir_ + "/fileindex_old.sqlite"));
   EXPECT_TRUE(FileExists(root_.Path("/volume2/@qoruindex/fileindex_new.sqlite")));
-  EXPECT_EQ(PathsBelow("fileindex_new", "/volume1/"), std::vector<std::string>{"/volume1/old/a.txt"})
+  EXPECT_EQ(PathsBelow("fileindex_new", "/volume1/"),
+            std::vector<std::string>{"/volume1/old/a.txt"})
       << "pending writes travel with the index";
 
   Json::Value migrate = Data("fileindex_new");
@@ -401,7 +403,8 @@ TEST_F(HandlerTest, IdleUpkeepMergesAndKeepsEveryDocumentFindable) {
   for (int batch = 0; batch < 6; ++batch) {
     Json::Value req(Json::objectValue);
     for (int i = 0; i < 50; ++i) {
-      Json::Value doc = FileDoc("/v/s/" + std::to_string(batch) + "/f" + std::to_string(i) + ".txt");
+      Json::Value doc =
+          FileDoc("/v/s/" + std::to_string(batch) + "/f" + std::to_string(i) + ".txt");
       doc["QORUMDTextContent"] = "common words batch" + std::to_string(batch);
       req["compound"].append(UpsertRequest("s", doc));
     }

@@ -38,7 +38,8 @@ class SearchTest : public ::testing::Test {
         {{"QORUMDTextContent", "budget annual, in the wrong order"}});
     Add("/v/s/docs2/hiddenfolder/plain.txt", 20, 400, {{"QORUMDTextContent", "nothing here"}});
     Add("/v/s/music/song.mp3", 4000000, 500,
-        {{"QORUMDAuthors", "Jean-Luc Picard"}, {"QORUMDDurationSecond", "241.5"},
+        {{"QORUMDAuthors", "Jean-Luc Picard"},
+         {"QORUMDDurationSecond", "241.5"},
          {"QORUMDMediaTypes", "Sound Stereo"}});
     Add("/v/s/music/track.FLAC", 9000000, 600, {{"QORUMDTitle", "Engage"}});
     Add("/v/s/mail/old.msg", 30, 700, {{"QORUMDTextContent", "a mail message"}});
@@ -92,40 +93,46 @@ TEST_F(SearchTest, QueryTextAndFiltersSelectTheRightFiles) {
       {"prefix word", R"({"query": "quart*"})", {"Quarterly Report.pdf"}},
       {"all words must match", R"({"query": "annual library"})", {"budget.docx"}},
       {"phrase keeps word order", R"({"query": "\"annual budget\""})", {"budget.docx"}},
-      {"words in any order", R"({"query": "annual budget"})",
-       {"budget.docx", "reversed.txt"}},
-      {"keyword field matches the whole value", R"({"query": "QORUMDOwnerUserID:1026"})",
+      {"words in any order", R"({"query": "annual budget"})", {"budget.docx", "reversed.txt"}},
+      {"keyword field matches the whole value",
+       R"({"query": "QORUMDOwnerUserID:1026"})",
        {"Quarterly Report.pdf"}},
       {"keyword field does not match a part", R"({"query": "QORUMDOwnerUserID:102"})", {}},
       {"field kept out of the catch-all", R"({"query": "hiddenfolder"})", {}},
       {"white-space field keeps hyphenated words", R"({"query": "jean-luc"})", {"song.mp3"}},
       {"white-space field does not split at hyphens", R"({"query": "jean"})", {}},
-      {"keyword value in the catch-all, whole", R"({"query": "\"sound stereo\""})",
-       {"song.mp3"}},
+      {"keyword value in the catch-all, whole", R"({"query": "\"sound stereo\""})", {"song.mp3"}},
       {"file name substring, any case", R"({"name": "EPO"})", {"Quarterly Report.pdf"}},
       {"file name substring with a blank", R"({"name": "ly rep"})", {"Quarterly Report.pdf"}},
       {"short file name substring", R"({"name": "mg"})", {"IMG_0001.JPG"}},
       {"query word found in a file name", R"({"query": "0001"})", {"IMG_0001.JPG"}},
-      {"int field compares as a number", R"({"query": "QORUMDFSSize:2048.0"})",
-       {"budget.docx"}},
-      {"double field compares as a number", R"({"query": "QORUMDDurationSecond:241.50"})",
+      {"int field compares as a number", R"({"query": "QORUMDFSSize:2048.0"})", {"budget.docx"}},
+      {"double field compares as a number",
+       R"({"query": "QORUMDDurationSecond:241.50"})",
        {"song.mp3"}},
-      {"bool field", R"({"query": "QORUMDIsDir:false", "path": "/v/s/music/"})",
+      {"bool field",
+       R"({"query": "QORUMDIsDir:false", "path": "/v/s/music/"})",
        {"song.mp3", "track.FLAC"}},
-      {"path prefix excludes a longer sibling", R"({"path": "/v/s/docs/"})",
+      {"path prefix excludes a longer sibling",
+       R"({"path": "/v/s/docs/"})",
        {"Quarterly Report.pdf", "budget.docx", "reversed.txt"}},
-      {"audio category (extension case folded)", R"({"category": "audio"})",
+      {"audio category (extension case folded)",
+       R"({"category": "audio"})",
        {"song.mp3", "track.FLAC"}},
       {"image category", R"({"category": ["image"]})", {"IMG_0001.JPG"}},
-      {"document category as its list stands (msgc, not msg)", R"({"category": "document"})",
+      {"document category as its list stands (msgc, not msg)",
+       R"({"category": "document"})",
        {"Quarterly Report.pdf", "budget.docx", "plain.txt", "reversed.txt"}},
       {"two categories", R"({"category": ["video", "image"]})", {"IMG_0001.JPG"}},
       {"extension", R"({"extension": ["PDF", "msg"]})", {"Quarterly Report.pdf", "old.msg"}},
-      {"size range", R"({"size": {"min": 1000, "max": 300000}})",
+      {"size range",
+       R"({"size": {"min": 1000, "max": 300000}})",
        {"IMG_0001.JPG", "Quarterly Report.pdf", "budget.docx"}},
-      {"modification range", R"({"modified": {"from": 200, "to": 400}})",
+      {"modification range",
+       R"({"modified": {"from": 200, "to": 400}})",
        {"Quarterly Report.pdf", "plain.txt", "reversed.txt"}},
-      {"words and filters together", R"({"query": "budget", "extension": "txt"})",
+      {"words and filters together",
+       R"({"query": "budget", "extension": "txt"})",
        {"reversed.txt"}},
   };
   for (const Case& c : cases) {
@@ -138,9 +145,10 @@ TEST_F(SearchTest, QueryTextAndFiltersSelectTheRightFiles) {
 }
 
 TEST_F(SearchTest, QueryTextIsNeverTakenAsSearchSyntax) {
-  const char* hostile[] = {"AND",        "OR OR",     "NOT budget", "budget)",   "(\"",
-                           "NEAR(a b)",  "col:^x",    "\"",         "*",         "-x +y",
-                           "a\"b\"c",    "{std_all}:x", "x * y",    "\\",        "'; DROP TABLE docs; --"};
+  const char* hostile[] = {
+      "AND",       "OR OR",       "NOT budget", "budget)", "(\"",
+      "NEAR(a b)", "col:^x",      "\"",         "*",       "-x +y",
+      "a\"b\"c",   "{std_all}:x", "x * y",      "\\",      "'; DROP TABLE docs; --"};
   for (const char* text : hostile) {
     Json::Value data(Json::objectValue);
     data["query"] = text;
@@ -188,7 +196,8 @@ TEST_F(SearchTest, SortingAndPaging) {
 TEST_F(SearchTest, RelevanceRanksTheBetterMatchFirst) {
   Json::Value data(Json::objectValue);
   data["query"] = "revenue";
-  Add("/v/s/docs/once.txt", 1, 1, {{"QORUMDTextContent", "revenue was mentioned once among many other words of text here"}});
+  Add("/v/s/docs/once.txt", 1, 1,
+      {{"QORUMDTextContent", "revenue was mentioned once among many other words of text here"}});
   Json::Value hits = Search(data)["hits"];
   ASSERT_EQ(hits.size(), 2u);
   EXPECT_EQ(hits[0]["id"].asString(), "/v/s/docs/Quarterly Report.pdf");
