@@ -8,7 +8,6 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <chrono>
 #include <condition_variable>
 #include <cstring>
 #include <deque>
@@ -17,7 +16,9 @@
 #include <vector>
 
 #include "common/error.h"
+#include "common/json_util.h"
 #include "sdk/platform.h"
+#include "tools/searchd/error_codes.h"
 #include "tools/searchd/frame.h"
 
 namespace vellis::searchd {
@@ -78,6 +79,11 @@ void Server::ServeConnection(int fd) {
   FrameStatus st = ReadFrame(fd, request, recv_timeout_ms_);
   if (st == FrameStatus::kOk) {
     std::string answer = handler_.HandleText(request);
+    if (answer.size() > kMaxMessageBytes) {
+      answer = JsonToString(ErrorAnswer(
+          kErrBadQuery, "The answer would exceed the message limit; ask for fewer documents or "
+                        "fields"));
+    }
     st = WriteFrame(fd, answer);
     if (st != FrameStatus::kOk) {
       sdk::GetPlatform()->Syslog(

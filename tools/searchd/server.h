@@ -3,7 +3,8 @@
 //
 // A connection whose frame is refused (length 0 or above the maximum),
 // truncated or too slow (kRecvTimeoutMs) is closed without an answer and
-// logged; it never reaches the handler.
+// logged; it never reaches the handler. An answer too large for one message
+// is replaced by error 1110.
 #pragma once
 
 #include <string>
