@@ -14,6 +14,7 @@
 #include "common/json_util.h"
 #include "common/root_path.h"
 #include "tests/support/temp_root.h"
+#include "tests/tools/searchd/daemon_process.h"
 #include "tests/tools/searchd/searchd_fixture.h"
 #include "tools/searchd/client.h"
 #include "tools/searchd/frame.h"
@@ -29,65 +30,19 @@ constexpr char kIndex[] = "fileindex_s";
 // Short, so that stalled-peer cases finish quickly.
 constexpr int kTestRecvTimeoutMs = 300;
 
-std::string DaemonBinary() {
-  const char* dir = getenv("VELLIS_TEST_BINARY_DIR");
-  return std::string(dir ? dir : ".") + "/tools/searchd/vellis-searchd";
-}
-
-int ConnectTo(const std::string& path) {
-  struct sockaddr_un addr;
-  memset(&addr, 0, sizeof(addr));
-  addr.sun_family = AF_UNIX;
-  strncpy(addr.sun_path, path.c_str(), sizeof(addr.sun_path) - 1);
-  int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-  if (connect(fd, reinterpret_cast<struct sockaddr*>(&addr), sizeof(addr)) != 0) {
-    close(fd);
-    return -1;
-  }
-  return fd;
-}
-
 class DaemonTest : public ::testing::Test {
  protected:
   void SetUp() override { Start(); }
-  void TearDown() override {
-    if (pid_ > 0) Stop(SIGKILL);
-  }
 
-  // Starts the daemon in the foreground and waits for its socket.
   void Start() {
-    pid_ = fork();
-    if (pid_ == 0) {
-      // The daemon copies its log lines to stderr in the foreground.
-      freopen("/dev/null", "w", stderr);
-      std::string timeout = "--recv-timeout-ms=" + std::to_string(kTestRecvTimeoutMs);
-      execl(DaemonBinary().c_str(), "vellis-searchd", "--foreground", timeout.c_str(),
-            static_cast<char*>(nullptr));
-      _exit(127);
-    }
-    for (int i = 0; i < 500; ++i) {
-      int status = 0;
-      if (waitpid(pid_, &status, WNOHANG) == pid_) {
-        pid_ = -1;
-        FAIL() << "daemon " << DaemonBinary() << " exited at start, status " << status;
-      }
-      int fd = ConnectTo(socket_);
-      if (fd >= 0) {
-        close(fd);
-        return;
-      }
-      std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    FAIL() << "daemon did not come up";
+    std::string why =
+        daemon_.Start(socket_, "--recv-timeout-ms=" + std::to_string(kTestRecvTimeoutMs));
+    ASSERT_EQ(why, "");
+    pid_ = daemon_.pid();
   }
-
-  // Sends `sig` and returns the exit status (or -signal).
   int Stop(int sig) {
-    kill(pid_, sig);
-    int status = 0;
-    waitpid(pid_, &status, 0);
     pid_ = -1;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+    return daemon_.Stop(sig);
   }
 
   Json::Value Call(const Json::Value& request) { return Exchange(socket_, request); }
@@ -106,6 +61,7 @@ class DaemonTest : public ::testing::Test {
 
   TempRoot root_;
   std::string socket_ = RootPath(kSocketPath);
+  DaemonProcess daemon_;
   pid_t pid_ = -1;
 };
 

@@ -18,6 +18,7 @@
 #include "fileindex/elastic/elastic_control.h"
 #include "tests/support/fake_share_platform.h"
 #include "tests/support/temp_root.h"
+#include "tests/tools/searchd/daemon_process.h"
 #include "tests/tools/searchd/searchd_fixture.h"
 #include "tools/searchd/client.h"
 #include "tools/searchd/frame.h"
@@ -41,27 +42,9 @@ class LibraryClientTest : public ::testing::Test {
     platform_.AddShare(music);
   }
 
-  void SetUp() override {
-    pid_ = fork();
-    if (pid_ == 0) {
-      freopen("/dev/null", "w", stderr);
-      const char* dir = getenv("VELLIS_TEST_BINARY_DIR");
-      std::string bin = std::string(dir ? dir : ".") + "/tools/searchd/vellis-searchd";
-      execl(bin.c_str(), "vellis-searchd", "--foreground", static_cast<char*>(nullptr));
-      _exit(127);
-    }
-    for (int i = 0; i < 500 && access(RootPath(kSocketPath).c_str(), F_OK) != 0; ++i) {
-      std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    ASSERT_EQ(access(RootPath(kSocketPath).c_str(), F_OK), 0) << "daemon did not come up";
-  }
+  void SetUp() override { ASSERT_EQ(daemon_.Start(RootPath(kSocketPath)), ""); }
 
-  void TearDown() override {
-    kill(pid_, SIGTERM);
-    int status = 0;
-    waitpid(pid_, &status, 0);
-    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "clean stop, status " << status;
-  }
+  void TearDown() override { EXPECT_EQ(daemon_.Stop(SIGTERM), 0) << "clean stop"; }
 
   // Creates the file and indexes it as the indexer does.
   void AddFile(const std::string& rel, const std::string& text) {
@@ -90,7 +73,7 @@ class LibraryClientTest : public ::testing::Test {
   std::string share_ = root_.Path("/volume1/music");
   FakeSharePlatform platform_;
   ScopedPlatform scoped_{&platform_};
-  pid_t pid_ = -1;
+  DaemonProcess daemon_;
 };
 
 TEST_F(LibraryClientTest, IndexerRequestsKeepTheIndexInStep) {
