@@ -80,9 +80,10 @@ void Server::ServeConnection(int fd) {
   if (st == FrameStatus::kOk) {
     std::string answer = handler_.HandleText(request);
     if (answer.size() > kMaxMessageBytes) {
-      answer = JsonToString(ErrorAnswer(
-          kErrBadQuery, "The answer would exceed the message limit; ask for fewer documents or "
-                        "fields"));
+      answer = JsonToString(
+          ErrorAnswer(kErrBadQuery,
+                      "The answer would exceed the message limit; ask for fewer documents or "
+                      "fields"));
     }
     st = WriteFrame(fd, answer);
     if (st != FrameStatus::kOk) {

@@ -72,7 +72,7 @@ int64_t Stmt::Int(int col) const { return sqlite3_column_int64(stmt_, col); }
 double Stmt::Double(int col) const { return sqlite3_column_double(stmt_, col); }
 bool Stmt::IsNull(int col) const { return sqlite3_column_type(stmt_, col) == SQLITE_NULL; }
 
-Db::Db(const std::string& file, bool create) {
+Db::Db(const std::string& file, bool create, int busy_timeout_ms) {
   int flags = SQLITE_OPEN_READWRITE | SQLITE_OPEN_NOMUTEX | (create ? SQLITE_OPEN_CREATE : 0);
   int rc = sqlite3_open_v2(file.c_str(), &db_, flags, nullptr);
   if (rc != SQLITE_OK) {
@@ -81,7 +81,7 @@ Db::Db(const std::string& file, bool create) {
     db_ = nullptr;
     throw Error(kErrStorage, "Cannot open index database " + file + ": " + msg);
   }
-  sqlite3_busy_timeout(db_, kBusyTimeoutMs);
+  sqlite3_busy_timeout(db_, busy_timeout_ms);
   sqlite3_extended_result_codes(db_, 1);
 }
 

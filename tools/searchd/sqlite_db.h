@@ -47,9 +47,10 @@ class Stmt {
 
 class Db {
  public:
-  // Opens `file` read-write (creating it when missing if `create`), with the
-  // busy time-out set. Throws kErrStorage.
-  Db(const std::string& file, bool create);
+  // Opens `file` read-write (creating it when missing if `create`); a lock
+  // held by another process is waited for up to `busy_timeout_ms`. Throws
+  // kErrStorage.
+  Db(const std::string& file, bool create, int busy_timeout_ms = kBusyTimeoutMs);
   ~Db();
   Db(const Db&) = delete;
   Db& operator=(const Db&) = delete;

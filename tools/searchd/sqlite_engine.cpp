@@ -61,11 +61,12 @@ void MakeFolder(const std::string& path) {
 
 }  // namespace
 
-SqliteEngine::SqliteEngine(const std::string& registry_file)
+SqliteEngine::SqliteEngine(const std::string& registry_file, int busy_timeout_ms)
     : registry_([&registry_file] {
         MakeFolder(fs::path(registry_file).parent_path().string());
         return registry_file;
-      }()) {}
+      }()),
+      busy_timeout_ms_(busy_timeout_ms) {}
 
 SqliteEngine::~SqliteEngine() = default;
 
@@ -85,7 +86,10 @@ SqliteIndex& SqliteEngine::Open(const std::string& id) {
   const RegistryEntry& e = Entry(id);
   auto it = open_.find(id);
   if (it == open_.end()) {
-    it = open_.emplace(id, std::make_unique<SqliteIndex>(DbFile(e.path, id), nullptr)).first;
+    it = open_
+             .emplace(id,
+                      std::make_unique<SqliteIndex>(DbFile(e.path, id), nullptr, busy_timeout_ms_))
+             .first;
   }
   return *it->second;
 }
@@ -105,7 +109,7 @@ void SqliteEngine::CreateIndex(const IndexSpec& spec) {
   MakeFolder(folder);
   std::string file = DbFile(folder, spec.id);
   bool existed = Exists(file);
-  auto index = std::make_unique<SqliteIndex>(file, &spec);
+  auto index = std::make_unique<SqliteIndex>(file, &spec, busy_timeout_ms_);
   try {
     registry_.Put(spec.id, RegistryEntry{folder, false});
   } catch (...) {

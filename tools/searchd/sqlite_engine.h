@@ -21,8 +21,10 @@ inline constexpr char kDbSuffix[] = ".sqlite";
 class SqliteEngine : public Engine {
  public:
   // Loads the registry at `registry_file` (its folder is created when
-  // missing). Throws Error kErrStorage for an unreadable registry.
-  explicit SqliteEngine(const std::string& registry_file);
+  // missing). A write waits up to `busy_timeout_ms` for another process's
+  // lock on an index before it fails with kErrBusy. Throws Error kErrStorage
+  // for an unreadable registry.
+  explicit SqliteEngine(const std::string& registry_file, int busy_timeout_ms = kBusyTimeoutMs);
   // Commits nothing: call CommitAll() first to keep pending writes.
   ~SqliteEngine() override;
 
@@ -59,6 +61,7 @@ class SqliteEngine : public Engine {
   SqliteIndex& OpenForWrite(const std::string& id);
 
   Registry registry_;
+  int busy_timeout_ms_;
   std::map<std::string, std::unique_ptr<SqliteIndex>> open_;
 };
 

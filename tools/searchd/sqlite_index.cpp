@@ -110,8 +110,8 @@ std::string CatchAllExpr(const QueryTerm& t) {
 
 }  // namespace
 
-SqliteIndex::SqliteIndex(const std::string& file, const IndexSpec* spec)
-    : db_(std::make_unique<Db>(file, spec != nullptr)) {
+SqliteIndex::SqliteIndex(const std::string& file, const IndexSpec* spec, int busy_timeout_ms)
+    : db_(std::make_unique<Db>(file, spec != nullptr, busy_timeout_ms)) {
   // Larger pages suit full-text segments; this only takes effect on a new
   // database.
   db_->Exec("PRAGMA page_size=" + std::to_string(kPageSize));

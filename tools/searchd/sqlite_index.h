@@ -38,7 +38,8 @@ class SqliteIndex {
   // schema takes the mappings, settings and event handler of `spec`;
   // kErrStorage when there is neither a stored schema nor a spec.
   // kErrBadMappings for unusable mappings.
-  SqliteIndex(const std::string& file, const IndexSpec* spec);
+  // `busy_timeout_ms`: see Db.
+  SqliteIndex(const std::string& file, const IndexSpec* spec, int busy_timeout_ms = kBusyTimeoutMs);
   // Rolls back uncommitted writes (Commit() first to keep them).
   ~SqliteIndex();
 

@@ -3,6 +3,7 @@
 #include "tools/searchd/handler.h"
 
 #include <gtest/gtest.h>
+#include <sqlite3.h>
 #include <sys/stat.h>
 
 #include <set>
@@ -426,6 +427,34 @@ TEST_F(HandlerTest, IdleUpkeepMergesAndKeepsEveryDocumentFindable) {
   Ok(UpsertRequest("s", FileDoc("/v/s/late.txt")));
   EXPECT_FALSE(handler_.Idle()) << "no upkeep while writes are uncommitted";
   EXPECT_TRUE(Ok(Request("index_stats", Data("s")))["merging"].asBool());
+}
+
+TEST(HandlerBusyTest, WriteLockedByAnotherProcessAnswersBusyAndLosesNothing) {
+  TempRoot root;
+  FakePlatform platform;
+  ScopedPlatform scoped(&platform);
+  SqliteEngine engine(RootPath(kRegistryPath), /*busy_timeout_ms=*/50);
+  Handler handler(engine);
+  ASSERT_TRUE(handler.Handle(CreateRequest("s", root.Path("/db")))["success"].asBool());
+  ASSERT_TRUE(handler.Handle(UpsertRequest("s", FileDoc("/v/s/first")))["success"].asBool());
+  Json::Value commit = Request("commit", Parse(R"({"id": "s"})"));
+  ASSERT_TRUE(handler.Handle(commit)["success"].asBool());
+
+  // Another process (here another connection) holds the write lock.
+  sqlite3* other = nullptr;
+  ASSERT_EQ(sqlite3_open(root.Path("/db/s.sqlite").c_str(), &other), SQLITE_OK);
+  ASSERT_EQ(sqlite3_exec(other, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr), SQLITE_OK);
+  Json::Value answer = handler.Handle(UpsertRequest("s", FileDoc("/v/s/second")));
+  EXPECT_FALSE(answer["success"].asBool());
+  EXPECT_EQ(answer["error"]["code"].asInt(), 1400) << JsonToString(answer);
+  Json::Value search = Request("document_search", Parse(R"({"id": "s"})"));
+  EXPECT_EQ(handler.Handle(search)["data"]["total"].asInt(), 1) << "reads go on";
+  sqlite3_exec(other, "ROLLBACK", nullptr, nullptr, nullptr);
+  sqlite3_close(other);
+
+  EXPECT_TRUE(handler.Handle(UpsertRequest("s", FileDoc("/v/s/second")))["success"].asBool())
+      << "the repeated request succeeds";
+  EXPECT_EQ(handler.Handle(search)["data"]["total"].asInt(), 2);
 }
 
 TEST_F(HandlerTest, TermSuggestionsFollowTheirDocuments) {
