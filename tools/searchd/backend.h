@@ -22,7 +22,7 @@
 namespace vellis::searchd {
 
 // What "index_create" hands over.
-struct IndexSpec {
+struct IndexConfig {
   std::string id;
   std::string path;  // the database folder (absolute)
   Json::Value settings;
@@ -48,10 +48,10 @@ class Engine {
  public:
   virtual ~Engine() = default;
 
-  // Creates the index, or does nothing when `spec.id` exists with the same
+  // Creates the index, or does nothing when `config.id` exists with the same
   // path. kErrIndexExists for the id at another path, kErrBadIndexId for an
   // id or path that cannot name its files safely, kErrBadMappings.
-  virtual void CreateIndex(const IndexSpec& spec) = 0;
+  virtual void CreateIndex(const IndexConfig& config) = 0;
   // Removes the index and its files. kErrIndexNotFound.
   virtual void DeleteIndex(const std::string& id) = 0;
   // Pausing commits pending writes; a paused index refuses writes with

@@ -132,15 +132,15 @@ Json::Value Handler::Run(const Json::Value& request, bool nested) {
 Json::Value Handler::Dispatch(const std::string& command, const Json::Value& data) {
   Json::Value none(Json::objectValue);
   if (command == "index_create") {
-    IndexSpec spec;
-    spec.id = IndexId(data);
-    spec.path = RequireString(data, kData, "path");
-    CheckDbFolder(spec.path);
-    spec.mappings = RequireObject(data, kData, "mappings");
-    spec.settings = data.isMember("settings") ? data["settings"] : Json::Value(Json::objectValue);
-    spec.event_handler =
+    IndexConfig config;
+    config.id = IndexId(data);
+    config.path = RequireString(data, kData, "path");
+    CheckDbFolder(config.path);
+    config.mappings = RequireObject(data, kData, "mappings");
+    config.settings = data.isMember("settings") ? data["settings"] : Json::Value(Json::objectValue);
+    config.event_handler =
         data.isMember("event_handler") ? data["event_handler"] : Json::Value(Json::objectValue);
-    engine_.CreateIndex(spec);
+    engine_.CreateIndex(config);
     return none;
   }
   if (command == "index_delete") {

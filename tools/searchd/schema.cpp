@@ -14,22 +14,23 @@ namespace {
   throw Error(kErrBadMappings, "Bad mappings: " + what);
 }
 
-FieldSpec ParseSpec(const Json::Value& obj, const FieldSpec& base, const std::string& name) {
+FieldOptions ParseOptions(const Json::Value& obj, const FieldOptions& base,
+                          const std::string& name) {
   if (!obj.isObject()) BadMappings("\"" + name + "\" is not an object");
-  FieldSpec spec = base;
+  FieldOptions opts = base;
   if (obj.isMember("type")) {
     const Json::Value& t = obj["type"];
     std::string type = t.isString() ? t.asString() : "";
     if (type == "string") {
-      spec.type = FieldType::kString;
+      opts.type = FieldType::kString;
     } else if (type == "text") {
-      spec.type = FieldType::kText;
+      opts.type = FieldType::kText;
     } else if (type == "int" || type == "long" || type == "integer") {
-      spec.type = FieldType::kInt;
+      opts.type = FieldType::kInt;
     } else if (type == "double" || type == "float") {
-      spec.type = FieldType::kDouble;
+      opts.type = FieldType::kDouble;
     } else if (type == "bool" || type == "boolean") {
-      spec.type = FieldType::kBool;
+      opts.type = FieldType::kBool;
     } else {
       BadMappings("unknown type " + JsonToString(t) + " of \"" + name + "\"");
     }
@@ -38,11 +39,11 @@ FieldSpec ParseSpec(const Json::Value& obj, const FieldSpec& base, const std::st
     const Json::Value& a = obj["analyzer"];
     std::string analyzer = a.isString() ? a.asString() : "";
     if (analyzer == "qorustandard" || analyzer == "standard") {
-      spec.analyzer = Analyzer::kStandard;
+      opts.analyzer = Analyzer::kStandard;
     } else if (analyzer == "keyword") {
-      spec.analyzer = Analyzer::kKeyword;
+      opts.analyzer = Analyzer::kKeyword;
     } else if (analyzer == "white space" || analyzer == "whitespace") {
-      spec.analyzer = Analyzer::kWhiteSpace;
+      opts.analyzer = Analyzer::kWhiteSpace;
     } else {
       BadMappings("unknown analyzer " + JsonToString(a) + " of \"" + name + "\"");
     }
@@ -52,9 +53,9 @@ FieldSpec ParseSpec(const Json::Value& obj, const FieldSpec& base, const std::st
     if (!obj[flag].isBool())
       BadMappings(std::string("\"") + flag + "\" of \"" + name + "\" is not a bool");
     bool value = obj[flag].asBool();
-    if (flag[0] == 'r') spec.required = value;
-    if (flag[0] == 's') spec.stored = value;
-    if (flag[0] == '_') spec.in_all = value;
+    if (flag[0] == 'r') opts.required = value;
+    if (flag[0] == 's') opts.stored = value;
+    if (flag[0] == '_') opts.in_all = value;
   }
   if (obj.isMember("preprocess")) {
     const Json::Value& steps = obj["preprocess"];
@@ -62,15 +63,15 @@ FieldSpec ParseSpec(const Json::Value& obj, const FieldSpec& base, const std::st
     for (const Json::Value& step : steps) {
       std::string s = step.isString() ? step.asString() : "";
       if (s == "tolower") {
-        spec.lower = true;
+        opts.lower = true;
       } else if (s == "ngram") {
-        spec.ngram = true;
+        opts.ngram = true;
       } else {
         BadMappings("unknown preprocess step " + JsonToString(step) + " of \"" + name + "\"");
       }
     }
   }
-  return spec;
+  return opts;
 }
 
 // Converts `v` in place to the field's type; false when it does not fit.
@@ -167,19 +168,19 @@ Schema Schema::FromMappings(const Json::Value& mappings) {
   if (!pid.isString() || pid.asString().empty()) BadMappings("\"property_id\" is not a field name");
   schema.property_id_ = pid.asString();
   if (mappings.isMember("default")) {
-    schema.default_ = ParseSpec(mappings["default"], FieldSpec(), "default");
+    schema.default_ = ParseOptions(mappings["default"], FieldOptions(), "default");
   }
   if (mappings.isMember("properties")) {
     const Json::Value& props = mappings["properties"];
     if (!props.isObject()) BadMappings("\"properties\" is not an object");
     for (const std::string& name : props.getMemberNames()) {
-      schema.fields_[name] = ParseSpec(props[name], schema.default_, name);
+      schema.fields_[name] = ParseOptions(props[name], schema.default_, name);
     }
   }
   return schema;
 }
 
-const FieldSpec& Schema::Spec(const std::string& field) const {
+const FieldOptions& Schema::Options(const std::string& field) const {
   auto it = fields_.find(field);
   return it == fields_.end() ? default_ : it->second;
 }
@@ -192,15 +193,15 @@ Json::Value Schema::Normalize(Json::Value doc) const {
       doc.removeMember(name);
       continue;
     }
-    const FieldSpec& spec = Spec(name);
+    const FieldOptions& opts = Options(name);
     // FitType leaves the value as it was when it does not fit.
-    if (!FitType(v, spec.type)) {
-      throw Error(kErrFieldType, "Field " + name + " must be of type " + TypeName(spec.type) +
+    if (!FitType(v, opts.type)) {
+      throw Error(kErrFieldType, "Field " + name + " must be of type " + TypeName(opts.type) +
                                      ", got " + JsonToString(v));
     }
   }
-  for (const auto& [name, spec] : fields_) {
-    if (spec.required && !doc.isMember(name)) {
+  for (const auto& [name, opts] : fields_) {
+    if (opts.required && !doc.isMember(name)) {
       throw Error(kErrRequiredField, "Required field " + name + " is missing");
     }
   }
@@ -211,16 +212,16 @@ IndexedForms Schema::Analyze(const Json::Value& doc) const {
   IndexedForms forms;
   for (const std::string& name : doc.getMemberNames()) {
     const Json::Value& v = doc[name];
-    const FieldSpec& spec = Spec(name);
+    const FieldOptions& opts = Options(name);
     std::string text = ValueText(v);
-    if (spec.ngram) {
-      Append(forms.name, spec.lower ? FoldCase(text) : text);
+    if (opts.ngram) {
+      Append(forms.name, opts.lower ? FoldCase(text) : text);
       // Its words also join the catch-all, so that a query word finds a file
       // by a word of its name ("0001" in IMG_0001.JPG); substrings go
       // through `name`.
-      if (spec.in_all) Append(forms.std_all, text);
+      if (opts.in_all) Append(forms.std_all, text);
     }
-    if (spec.analyzer == Analyzer::kKeyword) {
+    if (opts.analyzer == Analyzer::kKeyword) {
       // A keyword field matches whole values only, each element of an array
       // being a value of its own.
       Json::Value values = v;
@@ -232,14 +233,14 @@ IndexedForms Schema::Analyze(const Json::Value& doc) const {
         std::string one = ValueText(e);
         // The identity has its own column; no need to index it twice.
         if (name != property_id_) Append(forms.kw, HexToken(name + ":" + one));
-        if (spec.in_all) Append(forms.ws_all, HexToken(FoldCase(one)));
+        if (opts.in_all) Append(forms.ws_all, HexToken(FoldCase(one)));
       }
       continue;
     }
-    if (!spec.in_all) continue;
+    if (!opts.in_all) continue;
     if (name == kContentField) {
       Append(forms.content, text);
-    } else if (spec.analyzer == Analyzer::kWhiteSpace) {
+    } else if (opts.analyzer == Analyzer::kWhiteSpace) {
       for (const std::string& token : SplitBlanks(text))
         Append(forms.ws_all, HexToken(FoldCase(token)));
     } else {

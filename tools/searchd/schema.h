@@ -13,7 +13,7 @@ namespace vellis::searchd {
 enum class FieldType { kString, kText, kInt, kDouble, kBool };
 enum class Analyzer { kStandard, kKeyword, kWhiteSpace };
 
-struct FieldSpec {
+struct FieldOptions {
   FieldType type = FieldType::kString;
   Analyzer analyzer = Analyzer::kStandard;
   bool required = false;
@@ -47,8 +47,8 @@ class Schema {
   // The field holding the document identity ("property_id").
   const std::string& property_id() const { return property_id_; }
 
-  // The spec of `field`: its own entry, or the defaults.
-  const FieldSpec& Spec(const std::string& field) const;
+  // The options of `field`: its own entry, or the defaults.
+  const FieldOptions& Options(const std::string& field) const;
   bool IsListed(const std::string& field) const { return fields_.count(field) != 0; }
 
   // Checks `doc` against the mappings and returns it with values in their
@@ -64,8 +64,8 @@ class Schema {
 
  private:
   std::string property_id_;
-  FieldSpec default_;
-  std::map<std::string, FieldSpec> fields_;
+  FieldOptions default_;
+  std::map<std::string, FieldOptions> fields_;
 };
 
 // The text of a scalar or an array of scalars ("" for anything else):

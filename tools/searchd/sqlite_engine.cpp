@@ -99,19 +99,19 @@ SqliteIndex& SqliteEngine::OpenForWrite(const std::string& id) {
   return Open(id);
 }
 
-void SqliteEngine::CreateIndex(const IndexSpec& spec) {
-  std::string folder = NormalFolder(spec.path);
-  if (const RegistryEntry* e = registry_.Find(spec.id)) {
+void SqliteEngine::CreateIndex(const IndexConfig& config) {
+  std::string folder = NormalFolder(config.path);
+  if (const RegistryEntry* e = registry_.Find(config.id)) {
     if (e->path == folder) return;
-    throw Error(kErrIndexExists, "Index " + spec.id + " exists in another folder: " + e->path);
+    throw Error(kErrIndexExists, "Index " + config.id + " exists in another folder: " + e->path);
   }
-  Schema::FromMappings(spec.mappings);  // refuse bad mappings before touching files
+  Schema::FromMappings(config.mappings);  // refuse bad mappings before touching files
   MakeFolder(folder);
-  std::string file = DbFile(folder, spec.id);
+  std::string file = DbFile(folder, config.id);
   bool existed = Exists(file);
-  auto index = std::make_unique<SqliteIndex>(file, &spec, busy_timeout_ms_);
+  auto index = std::make_unique<SqliteIndex>(file, &config, busy_timeout_ms_);
   try {
-    registry_.Put(spec.id, RegistryEntry{folder, false});
+    registry_.Put(config.id, RegistryEntry{folder, false});
   } catch (...) {
     index.reset();
     if (!existed) {
@@ -119,7 +119,7 @@ void SqliteEngine::CreateIndex(const IndexSpec& spec) {
     }
     throw;
   }
-  open_[spec.id] = std::move(index);
+  open_[config.id] = std::move(index);
 }
 
 void SqliteEngine::DeleteIndex(const std::string& id) {

@@ -28,7 +28,7 @@ class SqliteEngine : public Engine {
   // Commits nothing: call CommitAll() first to keep pending writes.
   ~SqliteEngine() override;
 
-  void CreateIndex(const IndexSpec& spec) override;
+  void CreateIndex(const IndexConfig& config) override;
   void DeleteIndex(const std::string& id) override;
   void SetPaused(const std::string& id, bool paused) override;
   void Reconfigure(const std::string& id, const std::string& new_id,

@@ -110,8 +110,8 @@ std::string CatchAllExpr(const QueryTerm& t) {
 
 }  // namespace
 
-SqliteIndex::SqliteIndex(const std::string& file, const IndexSpec* spec, int busy_timeout_ms)
-    : db_(std::make_unique<Db>(file, spec != nullptr, busy_timeout_ms)) {
+SqliteIndex::SqliteIndex(const std::string& file, const IndexConfig* config, int busy_timeout_ms)
+    : db_(std::make_unique<Db>(file, config != nullptr, busy_timeout_ms)) {
   // Larger pages suit full-text segments; this only takes effect on a new
   // database.
   db_->Exec("PRAGMA page_size=" + std::to_string(kPageSize));
@@ -145,14 +145,14 @@ SqliteIndex::SqliteIndex(const std::string& file, const IndexSpec* spec, int bus
     }
   } else {
     get.Reset();
-    if (spec == nullptr) throw Error(kErrStorage, "Index database " + file + " has no schema");
-    mappings = spec->mappings;
+    if (config == nullptr) throw Error(kErrStorage, "Index database " + file + " has no schema");
+    mappings = config->mappings;
     schema_ = Schema::FromMappings(mappings);
     Stmt put(db_->get(), "INSERT INTO meta(key, value) VALUES (?, ?)");
     for (const auto& [key, value] :
-         {std::pair<const char*, const Json::Value*>{"mappings", &spec->mappings},
-          {"settings", &spec->settings},
-          {"event_handler", &spec->event_handler}}) {
+         {std::pair<const char*, const Json::Value*>{"mappings", &config->mappings},
+          {"settings", &config->settings},
+          {"event_handler", &config->event_handler}}) {
       put.Bind(1, std::string(key)).Bind(2, JsonToString(*value)).Run();
       put.Reset();
     }
@@ -410,14 +410,14 @@ Json::Value SqliteIndex::Project(const Json::Value& doc, const std::vector<std::
   Json::Value out(Json::objectValue);
   if (fields.empty()) {
     for (const std::string& name : doc.getMemberNames()) {
-      if (!schema_.Spec(name).stored) continue;
+      if (!schema_.Options(name).stored) continue;
       if (name == kContentField && !include_content) continue;
       out[name] = doc[name];
     }
     return out;
   }
   for (const std::string& name : fields) {
-    if (doc.isMember(name) && schema_.Spec(name).stored) out[name] = doc[name];
+    if (doc.isMember(name) && schema_.Options(name).stored) out[name] = doc[name];
   }
   return out;
 }
@@ -504,7 +504,7 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
       fts_and.push_back(expr);
       continue;
     }
-    const FieldSpec& spec = schema_.Spec(t.field);
+    const FieldOptions& opts = schema_.Options(t.field);
     bool prefix = t.kind == QueryTerm::Kind::kPrefix;
     if (t.field == pid) {
       if (prefix) {
@@ -512,16 +512,16 @@ SearchResult SqliteIndex::Search(const SearchQuery& q) {
       } else {
         where.Add("doc_id = ?", {t.text});
       }
-    } else if (spec.analyzer == Analyzer::kKeyword) {
+    } else if (opts.analyzer == Analyzer::kKeyword) {
       fts_and.push_back("{kw} : " + FtsQuote(HexToken(t.field + ":" + t.text)) + Star(t));
     } else if (t.field == kContentField) {
       std::string expr = "{content} : " + FtsQuote(t.text) + Star(t);
       add_rank(expr);
       fts_and.push_back(expr);
-    } else if (spec.type == FieldType::kInt || spec.type == FieldType::kDouble ||
-               spec.type == FieldType::kBool) {
+    } else if (opts.type == FieldType::kInt || opts.type == FieldType::kDouble ||
+               opts.type == FieldType::kBool) {
       Bound value;
-      if (spec.type == FieldType::kBool) {
+      if (opts.type == FieldType::kBool) {
         if (t.text != "true" && t.text != "false") {
           throw Error(kErrBadQuery, "Field " + t.field + " takes true or false, not " + t.text);
         }

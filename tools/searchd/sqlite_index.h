@@ -33,13 +33,14 @@ namespace vellis::searchd {
 
 class SqliteIndex {
  public:
-  // Opens `file`; creates it when missing only when `spec` is given. A
+  // Opens `file`; creates it when missing only when `config` is given. A
   // database without a stored
-  // schema takes the mappings, settings and event handler of `spec`;
-  // kErrStorage when there is neither a stored schema nor a spec.
+  // schema takes the mappings, settings and event handler of `config`;
+  // kErrStorage when there is neither a stored schema nor a config.
   // kErrBadMappings for unusable mappings.
   // `busy_timeout_ms`: see Db.
-  SqliteIndex(const std::string& file, const IndexSpec* spec, int busy_timeout_ms = kBusyTimeoutMs);
+  SqliteIndex(const std::string& file, const IndexConfig* config,
+              int busy_timeout_ms = kBusyTimeoutMs);
   // Rolls back uncommitted writes (Commit() first to keep them).
   ~SqliteIndex();
 
