@@ -18,5 +18,7 @@ struct Context {
 void AddQueueCommands(CLI::App& app, Context& ctx);
 void AddShareCommands(CLI::App& app, Context& ctx);
 void AddPathCommands(CLI::App& app, Context& ctx);
+// `vellis search`: a search through the search daemon (tools/searchd).
+void AddSearchCommands(CLI::App& app, Context& ctx);
 
 }  // namespace vellis::cli

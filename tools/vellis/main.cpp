@@ -17,6 +17,7 @@ int main(int argc, char** argv) {
   vellis::cli::AddQueueCommands(app, ctx);
   vellis::cli::AddShareCommands(app, ctx);
   vellis::cli::AddPathCommands(app, ctx);
+  vellis::cli::AddSearchCommands(app, ctx);
 
   try {
     app.parse(argc, argv);
