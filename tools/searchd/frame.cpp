@@ -81,12 +81,14 @@ const char* FrameStatusText(FrameStatus status) {
 
 FrameStatus ReadFrame(int fd, std::string& out, int timeout_ms) {
   int64_t deadline = NowMs() + timeout_ms;
-  uint32_t length = 0;
+  unsigned char header[sdk::kFrameHeaderSize];
   bool got_any = false;
   FrameStatus st =
-      RecvAll(fd, reinterpret_cast<char*>(&length), sizeof(length), deadline, &got_any);
+      RecvAll(fd, reinterpret_cast<char*>(header), sizeof(header), deadline, &got_any);
   if (st != FrameStatus::kOk) return st;
-  if (length == 0 || length > kMaxMessageBytes) return FrameStatus::kBadLength;
+  uint32_t length = 0;
+  std::string why;
+  if (!sdk::DecodeFrameHeader(header, &length, &why)) return FrameStatus::kBadLength;
   // The buffer grows with the bytes that actually arrive, so a large length
   // announced by a peer that then sends little costs no memory.
   out.clear();
@@ -108,8 +110,8 @@ FrameStatus ReadFrame(int fd, std::string& out, int timeout_ms) {
 FrameStatus WriteFrame(int fd, const std::string& message, int timeout_ms) {
   if (message.empty() || message.size() > kMaxMessageBytes) return FrameStatus::kBadLength;
   int64_t deadline = NowMs() + timeout_ms;
-  uint32_t length = static_cast<uint32_t>(message.size());
-  FrameStatus st = SendAll(fd, reinterpret_cast<const char*>(&length), sizeof(length), deadline);
+  const std::string header = sdk::EncodeFrameHeader(static_cast<uint32_t>(message.size()));
+  FrameStatus st = SendAll(fd, header.data(), header.size(), deadline);
   if (st != FrameStatus::kOk) return st;
   return SendAll(fd, message.data(), message.size(), deadline);
 }

@@ -13,13 +13,15 @@
 #include <cstdint>
 #include <string>
 
+#include "sdk/frame.h"
+
 namespace vellis::searchd {
 
 // The socket of the search daemon; resolve with RootPath() at use.
 inline constexpr char kSocketPath[] = "/var/run/qoruelasticd.sock";
 
-// The largest message, either way: 256 MiB.
-inline constexpr uint32_t kMaxMessageBytes = 256u * 1024 * 1024;
+// The largest message, either way: the library's limit (256 MiB).
+inline constexpr uint32_t kMaxMessageBytes = sdk::kMaxMessageSize;
 
 // Time a whole incoming message may take, counted from the start of the
 // read: a peer that stalls longer is dropped.
