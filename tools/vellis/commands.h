@@ -20,5 +20,7 @@ void AddShareCommands(CLI::App& app, Context& ctx);
 void AddPathCommands(CLI::App& app, Context& ctx);
 // `vellis search`: a search through the search daemon (tools/searchd).
 void AddSearchCommands(CLI::App& app, Context& ctx);
+// `vellis index load`: fills a share's index through the library's requests.
+void AddIndexCommands(CLI::App& app, Context& ctx);
 
 }  // namespace vellis::cli

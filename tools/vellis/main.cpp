@@ -18,6 +18,7 @@ int main(int argc, char** argv) {
   vellis::cli::AddShareCommands(app, ctx);
   vellis::cli::AddPathCommands(app, ctx);
   vellis::cli::AddSearchCommands(app, ctx);
+  vellis::cli::AddIndexCommands(app, ctx);
 
   try {
     app.parse(argc, argv);

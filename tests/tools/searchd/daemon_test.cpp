@@ -13,6 +13,7 @@
 
 #include "common/json_util.h"
 #include "common/root_path.h"
+#include "tests/support/cli_runner.h"
 #include "tests/support/temp_root.h"
 #include "tests/tools/searchd/daemon_process.h"
 #include "tests/tools/searchd/searchd_fixture.h"
@@ -212,27 +213,6 @@ TEST_F(DaemonTest, SearchWhileTenThousandDocumentsAreWritten) {
   EXPECT_EQ(DocumentCount(), 10010);
 }
 
-struct CliResult {
-  int status;
-  std::string out;
-};
-
-// Runs the built `vellis` with `args` (shell words), stdout and stderr
-// together.
-CliResult RunVellis(const std::string& args) {
-  const char* dir = getenv("VELLIS_TEST_BINARY_DIR");
-  std::string bin = std::string(dir ? dir : ".") + "/tools/vellis/vellis";
-  FILE* p = popen((bin + " " + args + " 2>&1").c_str(), "r");
-  CliResult r{-1, ""};
-  if (!p) return r;
-  char buf[4096];
-  size_t n;
-  while ((n = fread(buf, 1, sizeof(buf), p)) > 0) r.out.append(buf, n);
-  int status = pclose(p);
-  r.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-  return r;
-}
-
 TEST_F(DaemonTest, VellisSearchPrintsHitsWithSnippets) {
   Ok(CreateRequest(kIndex, root_.Path("/volume1/@qoruindex")));
   Json::Value pdf = FileDoc("/volume1/s/docs/plan.pdf");
@@ -241,28 +221,62 @@ TEST_F(DaemonTest, VellisSearchPrintsHitsWithSnippets) {
   Ok(UpsertRequest(kIndex, pdf));
   Ok(UpsertRequest(kIndex, song));
 
-  CliResult text = RunVellis("search budget --category document");
+  ::vellis::testing::CliRun text = ::vellis::testing::Vellis("search budget --category document");
   EXPECT_EQ(text.status, 0) << text.out;
   EXPECT_EQ(text.out,
             "/volume1/s/docs/plan.pdf\n"
             "    The [budget] plan for next year\n"
             "1 hit (1 shown)\n");
 
-  CliResult json = RunVellis("search budget --json --index " + std::string(kIndex));
+  ::vellis::testing::CliRun json = ::vellis::testing::Vellis("search budget --json --index " + std::string(kIndex));
   EXPECT_EQ(json.status, 0) << json.out;
   Json::Value answers = Parse(json.out);
   ASSERT_EQ(answers.size(), 1u) << json.out;
   EXPECT_EQ(answers[0]["total"].asInt(), 2);
 
-  CliResult unknown = RunVellis("search budget --index fileindex_none");
+  ::vellis::testing::CliRun unknown = ::vellis::testing::Vellis("search budget --index fileindex_none");
   EXPECT_EQ(unknown.status, 1);
   EXPECT_NE(unknown.out.find("error 1104: No index fileindex_none"), std::string::npos)
       << unknown.out;
 
   Stop(SIGTERM);
-  CliResult down = RunVellis("search budget");
+  ::vellis::testing::CliRun down = ::vellis::testing::Vellis("search budget");
   EXPECT_EQ(down.status, 1);
   EXPECT_NE(down.out.find("error 913: Connect failed"), std::string::npos) << down.out;
+}
+
+// The stand-in for the indexer's first pass: every indexable file of a real
+// share goes in with its text, through the library's own requests, and is
+// found by `vellis search`; what the rules refuse stays out.
+TEST_F(DaemonTest, VellisIndexLoadFillsTheShareIndexFromItsFiles) {
+  using ::vellis::testing::MakeDirs;
+  using ::vellis::testing::Vellis;
+  using ::vellis::testing::WriteFile;
+  const std::string share = root_.Path("/volume1/notes");
+  WriteFile(share + "/plans/budget.txt", "The budget plan for next year\n");
+  WriteFile(share + "/plans/todo.md", "Nothing about money here\n");
+  WriteFile(share + "/#recycle/old-budget.txt", "An old budget, thrown away\n");
+  ASSERT_EQ(0, symlink("/etc", (share + "/etc").c_str()));
+  ASSERT_EQ(Vellis("share add notes " + share + " --recycle-bin").status, 0);
+
+  ::vellis::testing::CliRun load = Vellis("index load notes");
+  EXPECT_EQ(load.status, 0) << load.out;
+  // The share's folder, plans/, its two files, #recycle/ and the link: the
+  // recycle bin and the link are refused.
+  EXPECT_EQ(load.out,
+            "loaded 4 documents into fileindex_notes (3 paths refused by the indexing rules, "
+            "0 failed)\n")
+      << load.out;
+
+  ::vellis::testing::CliRun hits = Vellis("search budget --index fileindex_notes");
+  EXPECT_EQ(hits.status, 0) << hits.out;
+  EXPECT_NE(hits.out.find(share + "/plans/budget.txt\n"), std::string::npos) << hits.out;
+  EXPECT_EQ(hits.out.find("old-budget"), std::string::npos) << hits.out;
+  EXPECT_NE(hits.out.find("1 hit"), std::string::npos) << hits.out;
+
+  ::vellis::testing::CliRun unknown = Vellis("index load nosuchshare");
+  EXPECT_EQ(unknown.status, 1);
+  EXPECT_NE(unknown.out.find("error 800"), std::string::npos) << unknown.out;
 }
 
 }  // namespace
