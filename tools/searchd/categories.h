@@ -1,7 +1,7 @@
 // The four file categories of a search filter, each a fixed query text of
-// extensions joined with " OR ". The texts are the product's own and are
-// used as they stand (the document list holds "msgc", for one); they are
-// not derived from the library's extension table.
+// extensions joined with " OR ", read from the library's category query
+// table (fileindex/util.h) and used as they stand (the document list holds
+// "msgc", for one); they are not derived from the extension table.
 #pragma once
 
 #include <string>
