@@ -1,0 +1,16 @@
+// The Linux platform's per-thread last error, read back with QLIBCErrGet.
+#pragma once
+
+namespace vellis::sdk {
+
+// Records `err` (an errno value or a PlatformErr) as the calling thread's
+// last platform error.
+void SetPlatformError(int err);
+
+// The calling thread's last platform error; 0 when none was recorded.
+int PlatformError();
+
+// Records `err` and returns -1: the failure result of most platform calls.
+int FailWith(int err);
+
+}  // namespace vellis::sdk

@@ -1,0 +1,140 @@
+#include "sdk/domain_socket.h"
+
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <memory>
+#include <thread>
+
+#include "common/root_path.h"
+#include "sdk/frame.h"
+#include "tests/support/fake_platform.h"
+#include "tests/support/fake_search_daemon.h"
+#include "tests/support/temp_root.h"
+
+namespace vellis::sdk {
+namespace {
+
+using testing::FakePlatform;
+using testing::FakeSearchDaemon;
+using testing::ScopedPlatform;
+
+class SockConnectionTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    int fds[2];
+    ASSERT_EQ(socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, fds), 0);
+    conn_ = std::make_unique<SockConnection>(fds[0]);
+    peer_ = fds[1];
+    conn_->SetTimeouts(100, 100);
+  }
+  void TearDown() override {
+    if (peer_ >= 0) close(peer_);
+  }
+  void PeerWrite(const std::string& bytes) {
+    ASSERT_EQ(write(peer_, bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
+  }
+  void ClosePeer() {
+    close(peer_);
+    peer_ = -1;
+  }
+
+  FakePlatform platform_;
+  ScopedPlatform scoped_{&platform_};
+  std::unique_ptr<SockConnection> conn_;
+  int peer_ = -1;
+};
+
+TEST_F(SockConnectionTest, MovesWholeMessagesOfAnySize) {
+  for (size_t size : {size_t{1}, size_t{100}, size_t{70000}, size_t{3} << 20}) {
+    std::string message(size, 'x');
+    message.front() = '{';
+    message.back() = '}';
+    conn_->SetTimeouts(5000, 5000);
+    SockConnection peer(dup(peer_));
+    peer.SetTimeouts(5000, 5000);
+    std::string received;
+    std::thread reader([&] { EXPECT_TRUE(peer.Recv(received)) << size; });
+    EXPECT_TRUE(conn_->Send(message)) << size;
+    reader.join();
+    EXPECT_EQ(received, message) << size;
+  }
+}
+
+TEST_F(SockConnectionTest, RefusesAnnouncedLengthsWithoutAllocatingAndCloses) {
+  for (uint32_t length : {0u, kMaxMessageSize + 1, 0xFFFFFFFFu}) {
+    SetUp();
+    PeerWrite(EncodeFrameHeader(length));
+    std::string message = "old";
+    EXPECT_FALSE(conn_->Recv(message)) << length;
+    EXPECT_EQ(conn_->fd(), -1) << length;
+    EXPECT_LE(message.capacity(), 64u) << "nothing allocated for " << length;
+    EXPECT_EQ(platform_.LogsContaining("receive refused").size(), 1u) << length;
+    platform_.ClearLogs();
+    TearDown();
+  }
+}
+
+TEST_F(SockConnectionTest, PeerClosingMidMessageIsAClearError) {
+  PeerWrite(EncodeFrameHeader(100) + "{\"success\":");
+  ClosePeer();
+  std::string message;
+  EXPECT_FALSE(conn_->Recv(message));
+  EXPECT_EQ(conn_->fd(), -1);
+  EXPECT_EQ(platform_.LogsContaining("peer closed the connection after 11 of 100 bytes").size(),
+            1u);
+}
+
+TEST_F(SockConnectionTest, SilentPeerTimesOut) {
+  std::string message;
+  EXPECT_FALSE(conn_->Recv(message));
+  EXPECT_EQ(platform_.LogsContaining("receive timed out after 100 ms, 0 of 4 bytes").size(), 1u);
+
+}
+
+TEST_F(SockConnectionTest, PeerThatNeverReadsTimesOutTheSend) {
+  std::string big(8u << 20, 'x');
+  EXPECT_FALSE(conn_->Send(big));
+  EXPECT_EQ(conn_->fd(), -1);
+  EXPECT_EQ(platform_.LogsContaining("send timed out after 100 ms").size(), 1u);
+}
+
+TEST_F(SockConnectionTest, SendToAGonePeerFailsWithoutSignal) {
+  ClosePeer();
+  EXPECT_FALSE(conn_->Send("{}"));  // SIGPIPE would end the test binary here
+  EXPECT_EQ(conn_->fd(), -1);
+  EXPECT_FALSE(conn_->Send("{}")) << "a closed connection stays closed";
+  EXPECT_FALSE(conn_->Send("")) << "an empty message is refused";
+}
+
+TEST(DomainSockConnectionTest, ConnectsOnlyWhereADaemonListens) {
+  FakePlatform platform;
+  ScopedPlatform scoped(&platform);
+  testing::TempRoot root;
+  DomainSockConnection missing(root.Path("/var/run/nobody.sock"));
+  EXPECT_EQ(missing.fd(), -1);
+  EXPECT_FALSE(missing.Connect());
+  EXPECT_EQ(missing.fd(), -1);
+
+  DomainSockConnection too_long("/" + std::string(200, 'a'));
+  EXPECT_FALSE(too_long.Connect());
+  EXPECT_EQ(errno, ENAMETOOLONG);
+
+  FakeSearchDaemon daemon(root.Path("/var/run/x.sock"));
+  daemon.Push(FakeSearchDaemon::Raw("{\"answer\":1}"));
+  DomainSockConnection conn(root.Path("/var/run/x.sock"));
+  ASSERT_TRUE(conn.Connect());
+  EXPECT_GE(conn.fd(), 0);
+  std::string answer;
+  EXPECT_TRUE(conn.Send("{\"question\":1}"));
+  EXPECT_TRUE(conn.Recv(answer));
+  EXPECT_EQ(answer, "{\"answer\":1}");
+  conn.Disconnect();
+  EXPECT_EQ(conn.fd(), -1);
+  ASSERT_EQ(daemon.RawRequests().size(), 1u);
+  EXPECT_EQ(daemon.RawRequests()[0], "{\"question\":1}");
+}
+
+}  // namespace
+}  // namespace vellis::sdk

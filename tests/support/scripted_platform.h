@@ -1,0 +1,39 @@
+// A FakePlatform whose sleeps and content extraction a test can script.
+#pragma once
+
+#include <json/json.h>
+
+#include <functional>
+#include <string>
+
+#include "tests/support/fake_platform.h"
+
+namespace vellis::testing {
+
+class ScriptedPlatform : public FakePlatform {
+ public:
+  using SleepHook = std::function<void(unsigned int seconds, size_t sleeps_so_far)>;
+  using ParseFileHook =
+      std::function<int(const std::string& path, const Json::Value& options, Json::Value* doc)>;
+
+  // Runs `hook` after each Sleep has been recorded (the count includes it).
+  void SetOnSleep(SleepHook hook) { on_sleep_ = std::move(hook); }
+  // Answers ParseFile with `hook` instead of the real extraction.
+  void SetParseFile(ParseFileHook hook) { parse_file_ = std::move(hook); }
+
+  void Sleep(unsigned int seconds) override {
+    FakePlatform::Sleep(seconds);
+    if (on_sleep_) on_sleep_(seconds, Sleeps().size());
+  }
+
+  int ParseFile(const std::string& path, const Json::Value& options, Json::Value* doc) override {
+    if (parse_file_) return parse_file_(path, options, doc);
+    return FakePlatform::ParseFile(path, options, doc);
+  }
+
+ private:
+  SleepHook on_sleep_;
+  ParseFileHook parse_file_;
+};
+
+}  // namespace vellis::testing
