@@ -9,7 +9,6 @@
 namespace vellis::fileindex {
 namespace {
 
-constexpr int kPseudoFsType = 12;  // excluded by its number, like image file systems
 constexpr int kHomeRecycleFlags = 11;
 
 bool Contains(const std::string& s, const char* needle) {
@@ -71,7 +70,8 @@ IndexRule CheckFullPathIndexable(const std::string& full_path) {
   if (fs_type < 0) return IndexRule::kUnexaminable;
   if (platform->QORUFSIsRemoteFS(fs_type)) return IndexRule::kRemoteFs;
   if (platform->QORUFSIsImageFS(fs_type)) return IndexRule::kImageFs;
-  if (fs_type == kPseudoFsType) return IndexRule::kPseudoFs;
+  // Type 12 is excluded by its number: the system's own file systems.
+  if (fs_type == sdk::kFsPseudo) return IndexRule::kPseudoFs;
 
   std::string share_name;
   std::string share_path;

@@ -2,6 +2,7 @@
 
 #include <poll.h>
 #include <sys/socket.h>
+#include <sys/time.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -161,6 +162,16 @@ bool DomainSockConnection::Connect() {
   memcpy(addr.sun_path, path_.c_str(), path_.size() + 1);
   int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
   if (fd < 0) return false;
+  // On a Unix socket the send time-out also bounds a connect to a daemon
+  // whose accept queue is full (transfers use their own deadlines).
+  const int ms = send_timeout_ms();
+  timeval tv{ms / 1000, (ms % 1000) * 1000};
+  if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &tv, sizeof(tv)) != 0) {
+    int saved = errno;
+    close(fd);
+    errno = saved;
+    return false;
+  }
   int rc;
   do {
     rc = connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof(addr));

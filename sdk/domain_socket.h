@@ -58,6 +58,8 @@ class SockConnection {
   int fd() const { return fd_; }
 
  protected:
+  int send_timeout_ms() const { return send_timeout_ms_; }
+
   int fd_ = -1;
 
  private:
@@ -78,8 +80,9 @@ class DomainSockConnection : public SockConnection {
   explicit DomainSockConnection(const std::string& path) : path_(path) {}
 
   // Connects (closing any earlier connection first). False when the path does
-  // not fit a socket address or when nobody listens there; errno then says
-  // why. The descriptor is close-on-exec.
+  // not fit a socket address, when nobody listens there, or when the daemon
+  // does not take the connection within the send time-out (its accept queue
+  // full); errno then says why. The descriptor is close-on-exec.
   bool Connect();
 
  private:

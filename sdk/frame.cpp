@@ -13,8 +13,8 @@ bool CheckLength(uint64_t length, const char* what, std::string* error) {
     return false;
   }
   if (length > kMaxMessageSize) {
-    *error = std::string(what) + " length " + std::to_string(length) +
-             " is above the maximum of " + std::to_string(kMaxMessageSize) + " bytes";
+    *error = std::string(what) + " length " + std::to_string(length) + " is above the maximum of " +
+             std::to_string(kMaxMessageSize) + " bytes";
     return false;
   }
   return true;

@@ -235,8 +235,7 @@ class Platform {
   // followed. 0 on success, negative when the path cannot be examined
   // (errno says why). Implementations may also throw; callers treat that as
   // a failure.
-  virtual int ParseFile(const std::string& path, const Json::Value& options,
-                        Json::Value* doc) = 0;
+  virtual int ParseFile(const std::string& path, const Json::Value& options, Json::Value* doc) = 0;
 };
 
 // The process's platform. Never null: the Linux platform until replaced.

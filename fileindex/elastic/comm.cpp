@@ -29,6 +29,15 @@ void WaitForSocket(const std::string& path) {
   errno = 0;
 }
 
+// At most this much of a bad answer goes into an error's reason, so that a
+// huge answer cannot flood the log.
+constexpr size_t kMaxRawInReason = 4096;
+
+std::string RawForReason(const std::string& raw) {
+  if (raw.size() <= kMaxRawInReason) return raw;
+  return raw.substr(0, kMaxRawInReason) + "...(" + std::to_string(raw.size()) + " bytes)";
+}
+
 }  // namespace
 
 RequestTimeouts TEST_SetRequestTimeouts(RequestTimeouts timeouts) {
@@ -51,7 +60,7 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req) {
   // abort inside the JSON library, so it is refused here as well.
   VELLIS_THROW_IF(!conn.Recv(resp_raw) || !JsonFromString(res, resp_raw) || !res.isObject() ||
                       !res.isMember("success") || !res["success"].isBool(),
-                  kErrDaemonUnreachable, "Recv failed, res=" + resp_raw);
+                  kErrDaemonUnreachable, "Recv failed, res=" + RawForReason(resp_raw));
   conn.Disconnect();
 
   if (!res["success"].asBool()) {
@@ -73,7 +82,7 @@ void SendRequestImpl(Json::Value& res, const Json::Value& req) {
   // compound request only when the daemon was busy for one of them.
   const Json::Value& data = answer["data"];
   VELLIS_THROW_IF(!data.isArray(), kErrDaemonUnreachable,
-                  "Compound answer without data array, res=" + resp_raw);
+                  "Compound answer without data array, res=" + RawForReason(resp_raw));
   const Json::Value& subs = req["compound"];
   for (Json::ArrayIndex i = 0; i < data.size(); ++i) {
     const Json::Value& sub = data[i];

@@ -28,7 +28,8 @@ inline constexpr int kElasticSocketWaits = 15;
 // - 913 "Recv failed, res=<raw text>" when no whole answer arrives within the
 //   receive time-out (sdk::kDefaultRecvTimeoutMs), when the peer closes
 //   early or announces a length of 0 or above sdk::kMaxMessageSize, or when
-//   the answer is not a JSON object with a bool "success";
+//   the answer is not a JSON object with a bool "success" (the raw text is
+//   cut after 4096 bytes, followed by "...(<size> bytes)");
 // - the daemon's own "error"."code" with "Request failed, msg=<msg>" when
 //   "success" is false (120 from the JSON helpers when "error", "code" or
 //   "msg" is missing or mistyped);

@@ -88,6 +88,14 @@ std::string SendCommandToDaemon(const std::string& type, const Json::Value& data
   VELLIS_THROW_IF(0 > (fd_socket = socket(PF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)), kErrInternal,
                   "socket failed, reason=" + ErrnoText(errno));
   ScopedFd closer(fd_socket);
+  // Set before connecting: on a Unix socket the send time-out also bounds a
+  // connect to a daemon whose accept queue is full.
+  timeval timeout = ToTimeval(g_send_timeout_ms.load());
+  VELLIS_THROW_IF(0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof(timeout)),
+                  kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
+  timeout = ToTimeval(g_recv_timeout_ms.load());
+  VELLIS_THROW_IF(0 > setsockopt(fd_socket, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof(timeout)),
+                  kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
 
   const std::string path = RootPath(kFileIndexDaemonSocketPath);
   sockaddr_un addr;
@@ -104,15 +112,6 @@ std::string SendCommandToDaemon(const std::string& type, const Json::Value& data
   }
   errno = 0;
 
-  timeval timeout = ToTimeval(g_send_timeout_ms.load());
-  VELLIS_THROW_IF(
-      0 > setsockopt(fd_socket, SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof(timeout)),
-      kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
-  timeout = ToTimeval(g_recv_timeout_ms.load());
-  VELLIS_THROW_IF(
-      0 > setsockopt(fd_socket, SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof(timeout)),
-      kErrInternal, "setsockopt failed, reason=" + ErrnoText(errno));
-
   Json::Value command(Json::objectValue);
   command["type"] = type;
   command["data"] = data;
@@ -120,7 +119,8 @@ std::string SendCommandToDaemon(const std::string& type, const Json::Value& data
   VELLIS_THROW_IF(text.size() > sdk::kMaxMessageSize, kErrInternal,
                   "command too long, size=" + std::to_string(text.size()));
   const std::string header = sdk::EncodeFrameHeader(static_cast<uint32_t>(text.size()));
-  BufferWrite(fd_socket, sdk::kFrameHeaderSize, reinterpret_cast<const unsigned char*>(header.data()));
+  BufferWrite(fd_socket, sdk::kFrameHeaderSize,
+              reinterpret_cast<const unsigned char*>(header.data()));
   BufferWrite(fd_socket, static_cast<unsigned int>(text.size()),
               reinterpret_cast<const unsigned char*>(text.data()));
 

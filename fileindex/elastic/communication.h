@@ -17,7 +17,8 @@ inline constexpr char kFileIndexDaemonSocketPath[] = "/var/run/fileindexd.sock";
 
 // Connection attempts while the socket file is missing, one second apart.
 inline constexpr int kCommandConnectAttempts = 5;
-// A daemon that does not take a command within this time is not waited for.
+// A daemon that does not take a command (or the connection) within this
+// time is not waited for.
 inline constexpr int kCommandSendTimeoutMs = 1000;
 // A daemon that does not answer within this time is taken as hung.
 inline constexpr int kCommandRecvTimeoutMs = 10000;

@@ -1,25 +1,16 @@
 #include "fileindex/elastic/elastic_control.h"
 
-#include <atomic>
-
 #include "common/fs_util.h"
 #include "common/json_util.h"
 #include "common/log.h"
 #include "fileindex/elastic/comm.h"
 #include "fileindex/status_mgr.h"
+#include "fileindex/util.h"
 #include "sdk/platform.h"
 #include "sdk/share.h"
 
 namespace vellis::fileindex::elastic {
 namespace {
-
-// Until the notification helper is linked in, a busy daemon is only logged.
-int LogLackOfMemory() {
-  VELLIS_LOG_ERR("qoruelasticd stays busy: indexing is short of memory");
-  return 0;
-}
-
-std::atomic<LackOfMemoryNotifier> g_notifier{&LogLackOfMemory};
 
 // Busy answers past this many retries are worth an administrator's look.
 constexpr unsigned kRetriesBeforeNotify = 10;
@@ -105,10 +96,6 @@ const Json::Value& QueryResults(const Json::Value& res) {
 
 }  // namespace
 
-LackOfMemoryNotifier TEST_SetLackOfMemoryNotifier(LackOfMemoryNotifier notifier) {
-  return g_notifier.exchange(notifier ? notifier : &LogLackOfMemory);
-}
-
 void SendRequestRetryOnBusy(Json::Value& res, const Json::Value& req) {
   unsigned retry = 0;
   bool notified = false;
@@ -125,11 +112,11 @@ void SendRequestRetryOnBusy(Json::Value& res, const Json::Value& req) {
                    command.c_str(), db.c_str());
     ++retry;
     if (retry > kRetriesBeforeNotify && !notified) {
-      g_notifier.load()();
+      NotifyLackOfMemory();
       notified = true;
     }
     sdk::Platform* platform = sdk::GetPlatform();
-    platform->Sleep(static_cast<unsigned>(platform->Rand() % 5) * 60 + 900);
+    platform->Sleep(static_cast<unsigned>(platform->Rand()) % 5 * 60 + 900);
   }
 }
 

@@ -25,18 +25,11 @@ namespace vellis::fileindex::elastic {
 // count ("Retry[<n>] since qoruelasticd is busy. Command: ..., db: ...") and
 // waited out for (Rand() % 5) * 60 + 900 seconds through the platform. After
 // the eleventh busy answer of one call the administrators are told once that
-// indexing is short of memory.
+// indexing is short of memory (NotifyLackOfMemory of fileindex/util.h).
 void SendRequestRetryOnBusy(Json::Value& res, const Json::Value& req);
 
 // SendRequestRetryOnBusy with the answer dropped.
 void SendRequestDiscardResult(const Json::Value& req);
-
-// The lack-of-memory notification; returns the notifier's result.
-using LackOfMemoryNotifier = int (*)();
-
-// Test-only: replaces the notification sent after the eleventh busy answer
-// and returns the previous one.
-LackOfMemoryNotifier TEST_SetLackOfMemoryNotifier(LackOfMemoryNotifier notifier);
 
 // --- Index lifecycle ---
 

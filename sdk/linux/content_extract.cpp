@@ -90,9 +90,9 @@ void FillFileSystemFields(const std::string& path, const FileFacts& facts, Json:
   d[fe::kQORUMDExtension] = GetFileExtension(path, false);
   d[fe::kQORUMDKind] = GetFileExtension(path, true);
   d[fe::kQORUMDIsDir] = S_ISDIR(facts.mode);
-  d[fe::kQORUMDFSSize] = static_cast<Json::UInt64>(facts.size);
-  d[fe::kQORUMDLogicalSize] = static_cast<Json::UInt64>(facts.size);
-  d[fe::kQORUMDPhysicalSize] = static_cast<Json::UInt64>(facts.blocks * 512);
+  d[fe::kQORUMDFSSize] = static_cast<Json::Int64>(facts.size);
+  d[fe::kQORUMDLogicalSize] = static_cast<Json::Int64>(facts.size);
+  d[fe::kQORUMDPhysicalSize] = static_cast<Json::Int64>(facts.blocks * 512);
   d[fe::kQORUMDFSContentChangeDate] = static_cast<Json::Int64>(facts.mtime);
   d[fe::kQORUMDAttributeChangeDate] = static_cast<Json::Int64>(facts.ctime);
   if (facts.has_btime) {
@@ -107,9 +107,10 @@ void FillFileSystemFields(const std::string& path, const FileFacts& facts, Json:
 }
 
 bool IsPlainTextExtension(const std::string& lower_extension) {
-  static const char* const kTextExtensions[] = {
-      "txt", "text", "log", "md", "csv", "tsv", "json", "xml", "htm", "html", "ini", "conf", "cfg",
-      "yaml", "yml", "c", "h", "cc", "cpp", "hpp", "py", "sh", "java", "js", "css", "srt", "tex"};
+  static const char* const kTextExtensions[] = {"txt", "text", "log",  "md",  "csv",  "tsv", "json",
+                                                "xml", "htm",  "html", "ini", "conf", "cfg", "yaml",
+                                                "yml", "c",    "h",    "cc",  "cpp",  "hpp", "py",
+                                                "sh",  "java", "js",   "css", "srt",  "tex"};
   for (const char* ext : kTextExtensions) {
     if (lower_extension == ext) return true;
   }
@@ -143,8 +144,8 @@ int ExtractDocument(const std::string& path, const Json::Value& options, Json::V
   }
   Json::Value out(Json::objectValue);
   FillFileSystemFields(path, facts, &out);
-  const bool need_meta = options.isObject() && options[fe::kCENeedMeta].isBool() &&
-                         options[fe::kCENeedMeta].asBool();
+  const bool need_meta =
+      options.isObject() && options[fe::kCENeedMeta].isBool() && options[fe::kCENeedMeta].asBool();
   std::string text;
   if (need_meta && S_ISREG(facts.mode) && IsPlainTextExtension(GetFileExtension(path, true)) &&
       ReadText(path, facts, &text)) {

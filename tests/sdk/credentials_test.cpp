@@ -51,8 +51,13 @@ TEST_F(CredentialsTest, SwitchesToTheUserAndBack) {
     SDKCredentials creds("nobody");
     EXPECT_EQ(geteuid(), nobody_.uid);
     EXPECT_EQ(getegid(), nobody_.gid);
-    // Really unprivileged: root's own folder is closed now.
+    // Really unprivileged: root's own folder is closed now, and root's
+    // supplementary groups are gone.
     EXPECT_NE(0, faccessat(AT_FDCWD, "/root", W_OK, AT_EACCESS));
+    gid_t groups[64];
+    int n = getgroups(64, groups);
+    ASSERT_GE(n, 0);
+    for (int i = 0; i < n; ++i) EXPECT_NE(groups[i], 0u) << "group " << i;
   }
   EXPECT_EQ(geteuid(), 0u);
   EXPECT_EQ(getegid(), 0u);

@@ -16,8 +16,8 @@ TEST(FrameTest, HeaderRoundTripsUsableLengths) {
     EXPECT_EQ(in_host_order, length) << "host byte order expected";
     uint32_t decoded = 0;
     std::string error;
-    EXPECT_TRUE(DecodeFrameHeader(reinterpret_cast<const unsigned char*>(header.data()), &decoded,
-                                  &error))
+    EXPECT_TRUE(
+        DecodeFrameHeader(reinterpret_cast<const unsigned char*>(header.data()), &decoded, &error))
         << length << ": " << error;
     EXPECT_EQ(decoded, length);
   }
@@ -37,8 +37,8 @@ TEST(FrameTest, RefusesLengthsNoJsonTextCanHave) {
     std::string header = EncodeFrameHeader(c.length);
     uint32_t decoded = 0;
     std::string error;
-    EXPECT_FALSE(DecodeFrameHeader(reinterpret_cast<const unsigned char*>(header.data()),
-                                   &decoded, &error))
+    EXPECT_FALSE(
+        DecodeFrameHeader(reinterpret_cast<const unsigned char*>(header.data()), &decoded, &error))
         << c.length;
     EXPECT_NE(error.find(c.explanation), std::string::npos) << c.length << ": " << error;
     EXPECT_EQ(decoded, c.length);

@@ -36,7 +36,9 @@ FakeUnixServer::~FakeUnixServer() {
   unlink(path_.c_str());
 }
 
-void FakeUnixServer::Start() { thread_ = std::thread([this] { Run(); }); }
+void FakeUnixServer::Start() {
+  thread_ = std::thread([this] { Run(); });
+}
 
 void FakeUnixServer::Stop() {
   if (!thread_.joinable()) return;

@@ -1,4 +1,5 @@
-// A FakePlatform whose sleeps and content extraction a test can script.
+// A FakeSharePlatform whose sleeps and content extraction a test can
+// script.
 #pragma once
 
 #include <json/json.h>
@@ -6,11 +7,11 @@
 #include <functional>
 #include <string>
 
-#include "tests/support/fake_platform.h"
+#include "tests/support/fake_share_platform.h"
 
 namespace vellis::testing {
 
-class ScriptedPlatform : public FakePlatform {
+class ScriptedPlatform : public FakeSharePlatform {
  public:
   using SleepHook = std::function<void(unsigned int seconds, size_t sleeps_so_far)>;
   using ParseFileHook =
@@ -22,13 +23,13 @@ class ScriptedPlatform : public FakePlatform {
   void SetParseFile(ParseFileHook hook) { parse_file_ = std::move(hook); }
 
   void Sleep(unsigned int seconds) override {
-    FakePlatform::Sleep(seconds);
+    FakeSharePlatform::Sleep(seconds);
     if (on_sleep_) on_sleep_(seconds, Sleeps().size());
   }
 
   int ParseFile(const std::string& path, const Json::Value& options, Json::Value* doc) override {
     if (parse_file_) return parse_file_(path, options, doc);
-    return FakePlatform::ParseFile(path, options, doc);
+    return FakeSharePlatform::ParseFile(path, options, doc);
   }
 
  private:

@@ -16,5 +16,7 @@ struct Context {
 };
 
 void AddQueueCommands(CLI::App& app, Context& ctx);
+void AddShareCommands(CLI::App& app, Context& ctx);
+void AddPathCommands(CLI::App& app, Context& ctx);
 
 }  // namespace vellis::cli

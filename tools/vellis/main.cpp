@@ -14,6 +14,8 @@ int main(int argc, char** argv) {
 
   vellis::cli::Context ctx;
   vellis::cli::AddQueueCommands(app, ctx);
+  vellis::cli::AddShareCommands(app, ctx);
+  vellis::cli::AddPathCommands(app, ctx);
 
   try {
     app.parse(argc, argv);

@@ -73,7 +73,8 @@ TEST_F(SendRequestImplTest, GivesUpWaitingAfterFifteenSecondsAndFailsToConnect) 
   auto waits = platform_.LogsContaining("elastic socket is not ready, retry ... ");
   ASSERT_EQ(waits.size(), 15u);
   EXPECT_NE(waits.back().find("retry ... 15"), std::string::npos) << waits.back();
-  EXPECT_EQ(platform_.LogsContaining("Failed [!conn.Connect()], reason: Connect failed").size(), 1u);
+  EXPECT_EQ(platform_.LogsContaining("Failed [!conn.Connect()], reason: Connect failed").size(),
+            1u);
 }
 
 TEST_F(SendRequestImplTest, ReturnsTheWholeAnswer) {
@@ -94,10 +95,13 @@ TEST_F(SendRequestImplTest, RefusesBadAnswersWithAClearError) {
     std::string reason;
   } cases[] = {
       {FakeSearchDaemon::Raw("not json"), 913, "Recv failed, res=not json"},
+      {FakeSearchDaemon::Raw(std::string(10000, 'x')), 913,
+       "Recv failed, res=" + std::string(4096, 'x') + "...(10000 bytes)"},
       {FakeSearchDaemon::Raw(R"({"data":1})"), 913, R"(Recv failed, res={"data":1})"},
       {FakeSearchDaemon::Raw(R"({"success":"yes"})"), 913, R"(Recv failed, res={"success":"yes"})"},
       {FakeSearchDaemon::Raw("[true]"), 913, "Recv failed, res=[true]"},
-      {FakeSearchDaemon::Raw(R"({"success":true} x)"), 913, R"(Recv failed, res={"success":true} x)"},
+      {FakeSearchDaemon::Raw(R"({"success":true} x)"), 913,
+       R"(Recv failed, res={"success":true} x)"},
       {FakeSearchDaemon::HeaderOnly(sdk::kMaxMessageSize + 1), 913, "Recv failed, res="},
       {FakeSearchDaemon::HeaderOnly(0), 913, "Recv failed, res="},
       {FakeSearchDaemon::CloseMidMessage(100, R"({"succ)"), 913, "Recv failed, res="},
@@ -146,8 +150,8 @@ TEST_F(SendRequestImplTest, CompoundAnswerThrowsOnBusySubRequestAfterLoggingOthe
   }
   auto logged = platform_.LogsContaining("Compound failed: ");
   ASSERT_EQ(logged.size(), 1u);
-  EXPECT_NE(logged[0].find("(SendRequestImpl) Compound failed: " + JsonToString(req["compound"][0]) +
-                           " (5) bad doc"),
+  EXPECT_NE(logged[0].find("(SendRequestImpl) Compound failed: " +
+                           JsonToString(req["compound"][0]) + " (5) bad doc"),
             std::string::npos)
       << logged[0];
 }

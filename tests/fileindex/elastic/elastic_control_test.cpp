@@ -2,7 +2,6 @@
 
 #include <gtest/gtest.h>
 
-#include <atomic>
 #include <functional>
 #include <memory>
 
@@ -26,16 +25,16 @@ Json::Value Parse(const std::string& text) {
   return v;
 }
 
-std::atomic<int> g_notifications{0};
-int CountNotification() { return ++g_notifications; }
-
 class ElasticControlTest : public ::testing::Test {
  protected:
-  void SetUp() override {
-    g_notifications = 0;
-    old_notifier_ = TEST_SetLackOfMemoryNotifier(&CountNotification);
+  // Runs of the administrators' notifier that report a lack of memory.
+  int MemoryNotifications() const {
+    int n = 0;
+    for (const auto& exec : platform_.Execs()) {
+      for (const auto& arg : exec.args) n += arg == "error:lack_of_memory";
+    }
+    return n;
   }
-  void TearDown() override { TEST_SetLackOfMemoryNotifier(old_notifier_); }
 
   // Answers from the document model once the script is used up.
   void ServeStore() {
@@ -47,7 +46,6 @@ class ElasticControlTest : public ::testing::Test {
   testing::ScopedPlatform scoped_{&platform_};
   FakeSearchDaemon daemon_{RootPath(kElasticSocketPath)};
   testing::FakeDocumentStore store_;
-  LackOfMemoryNotifier old_notifier_ = nullptr;
 };
 
 TEST_F(ElasticControlTest, BusyDaemonIsWaitedOutAndNotifiedOnceAfterEleventhAnswer) {
@@ -57,7 +55,7 @@ TEST_F(ElasticControlTest, BusyDaemonIsWaitedOutAndNotifiedOnceAfterEleventhAnsw
   SendRequestRetryOnBusy(res, Parse(R"({"command":"commit","data":{"id":"fileindex_music"}})"));
   EXPECT_EQ(res, Parse(R"({"success":true})"));
   EXPECT_EQ(daemon_.Requests().size(), 12u);
-  EXPECT_EQ(g_notifications, 1);
+  EXPECT_EQ(MemoryNotifications(), 1);
   std::vector<unsigned> expected_sleeps = {900, 960, 1020, 1080, 1140};
   expected_sleeps.resize(11, 1020);  // 7 % 5 == 2 from then on
   EXPECT_EQ(platform_.Sleeps(), expected_sleeps);
@@ -76,11 +74,12 @@ TEST_F(ElasticControlTest, NotificationCountsDependOnlyOnBusyAnswers) {
     int busy;
     int notifications;
   } cases[] = {{0, 0}, {10, 0}, {11, 1}, {30, 1}};
+  int before = 0;
   for (const auto& c : cases) {
-    g_notifications = 0;
     daemon_.Push(FakeSearchDaemon::Busy(1400), c.busy);
     SendRequestDiscardResult(Parse(R"({"command":"commit","data":{"id":"fileindex_s"}})"));
-    EXPECT_EQ(g_notifications, c.notifications) << c.busy << " busy answers";
+    EXPECT_EQ(MemoryNotifications() - before, c.notifications) << c.busy << " busy answers";
+    before = MemoryNotifications();
   }
 }
 
@@ -119,12 +118,6 @@ TEST_F(ElasticControlTest, CompoundWithBusySubRequestIsRetriedWholeAndLoggedSafe
   EXPECT_NE(platform_.LogsContaining("Command: compound[0], db: ").size(), 0u);
 }
 
-TEST_F(ElasticControlTest, IndexIdentifierIsThePrefixAndTheNameUnchanged) {
-  for (const std::string share : {"music", "my music", "m\xC3\xBAsica", "", "a/b"}) {
-    EXPECT_EQ(GetFileIndexID(share), "fileindex_" + share);
-  }
-}
-
 TEST_F(ElasticControlTest, IndexLifecycleRequests) {
   struct Case {
     std::function<void()> call;
@@ -153,17 +146,18 @@ TEST_F(ElasticControlTest, IndexLifecycleRequests) {
 
 TEST_F(ElasticControlTest, UpsertAndAttrSendTheExtractedDocument) {
   std::vector<Json::Value> options_seen;
-  platform_.SetParseFile([&](const std::string& path, const Json::Value& options, Json::Value* doc) {
-    options_seen.push_back(options);
-    (*doc)["QORUMDPath"] = path;
-    (*doc)["QORUMDFSName"] = "a.txt";
-    return 0;
-  });
+  platform_.SetParseFile(
+      [&](const std::string& path, const Json::Value& options, Json::Value* doc) {
+        options_seen.push_back(options);
+        (*doc)["QORUMDPath"] = path;
+        (*doc)["QORUMDFSName"] = "a.txt";
+        return 0;
+      });
   IndexUpsert("s", "/v/s/a.txt", true);
   IndexUpsert("s", "/v/s/a.txt", false);
   IndexAttr("s", "/v/s/a.txt");
-  const Json::Value doc = Parse(
-      R"({"QORUMDPath":"/v/s/a.txt","QORUMDFSName":"a.txt","QORUMDSearchFileName":"a.txt"})");
+  const Json::Value doc =
+      Parse(R"({"QORUMDPath":"/v/s/a.txt","QORUMDFSName":"a.txt","QORUMDSearchFileName":"a.txt"})");
   auto sent = daemon_.Requests();
   ASSERT_EQ(sent.size(), 3u);
   const char* commands[] = {"document_upsert_by_id", "document_upsert_by_id", "document_set_by_id"};
@@ -173,7 +167,8 @@ TEST_F(ElasticControlTest, UpsertAndAttrSendTheExtractedDocument) {
     EXPECT_EQ(sent[i]["data"]["id"], "fileindex_s") << i;
     EXPECT_EQ(sent[i]["data"]["doc_id"], "/v/s/a.txt") << i;
     EXPECT_EQ(sent[i]["data"]["data"], doc) << i;
-    EXPECT_EQ(options_seen[i], Parse(need_meta[i] ? R"({"need_meta":true})" : R"({"need_meta":false})"));
+    EXPECT_EQ(options_seen[i],
+              Parse(need_meta[i] ? R"({"need_meta":true})" : R"({"need_meta":false})"));
   }
 }
 
@@ -267,8 +262,8 @@ TEST_F(ElasticControlTest, RenamingAFileSendsAnEmptyCompoundAndSkipsStrayAnswers
 }
 
 TEST_F(ElasticControlTest, PrefixListingAppendsAndRefusesAnswersWithoutData) {
-  daemon_.Push(FakeSearchDaemon::Success(
-      Parse(R"([{"QORUMDPath":"/v/s/d/1"},{"other":1},{"QORUMDPath":7},{"QORUMDPath":"/v/s/d/2"}])")));
+  daemon_.Push(FakeSearchDaemon::Success(Parse(
+      R"([{"QORUMDPath":"/v/s/d/1"},{"other":1},{"QORUMDPath":7},{"QORUMDPath":"/v/s/d/2"}])")));
   std::vector<std::string> paths = {"kept"};
   IndexGetByPrefixPath("s", "/v/s/d", paths);
   EXPECT_EQ(paths, (std::vector<std::string>{"kept", "/v/s/d/1", "/v/s/d/2"}));

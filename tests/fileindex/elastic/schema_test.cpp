@@ -18,8 +18,13 @@ TEST(SchemaTest, MappingsListFiftyThreeFieldsInTheTemplateOrder) {
   // daemon sees is checked on the template text itself: each property key
   // occurs once, after the one before it.
   const std::string text = kFileIndexMappingsText;
-  const char* ordered[] = {kQORUMDPath, kQORUMDFSName, kQORUMDTextContent, kQORUMDKeywords,
-                           "QORUMDFinderLabel", kQORUMDSearchFileName, kUnderscoreQORUMDUserTags,
+  const char* ordered[] = {kQORUMDPath,
+                           kQORUMDFSName,
+                           kQORUMDTextContent,
+                           kQORUMDKeywords,
+                           "QORUMDFinderLabel",
+                           kQORUMDSearchFileName,
+                           kUnderscoreQORUMDUserTags,
                            "QORUMDSpotlightBoost"};
   size_t last = text.find("\"properties\"");
   for (const char* field : ordered) {
@@ -59,11 +64,13 @@ TEST(SchemaTest, MappingsKeepTheDaemonsSpellings) {
   EXPECT_EQ(props[kQORUMDKeywords], Json::Value(Json::objectValue));
   EXPECT_FALSE(props.isMember(kUnderscoreQORUMDFinderLabel));
   int with_preprocess = 0;
-  for (const auto& name : props.getMemberNames()) with_preprocess += props[name].isMember("preprocess");
+  for (const auto& name : props.getMemberNames())
+    with_preprocess += props[name].isMember("preprocess");
   EXPECT_EQ(with_preprocess, 1);
   EXPECT_EQ(JsonToString(props[kQORUMDSearchFileName]["preprocess"]), R"(["tolower","ngram"])");
-  EXPECT_EQ(JsonToString(GetFileIndexMappings()["default"]),
-            R"({"_all":true,"analyzer":"qorustandard","required":false,"stored":true,"type":"string"})");
+  EXPECT_EQ(
+      JsonToString(GetFileIndexMappings()["default"]),
+      R"({"_all":true,"analyzer":"qorustandard","required":false,"stored":true,"type":"string"})");
 }
 
 TEST(SchemaTest, SettingsAndEventHandler) {

@@ -80,8 +80,8 @@ TEST_F(ShareIndexTest, FailedCommitOnAFullVolumeFlagsTheShare) {
   platform_.ClearCalls();
   IndexCommit("music");
   for (const auto& call : platform_.Calls()) EXPECT_NE(call, "QORUQuotaIsEnough");
-  EXPECT_EQ(daemon_.Requests().back(),
-            daemon_.Requests().front()) << "the same commit request every time";
+  EXPECT_EQ(daemon_.Requests().back(), daemon_.Requests().front())
+      << "the same commit request every time";
 }
 
 }  // namespace
