@@ -77,6 +77,10 @@ class FolderMgr {
             unsigned int limit, const std::string& sort_by,
             const std::string& sort_direction) const;
 
+  // The entries in list order. The records are shared with this instance:
+  // changing one changes what Save() writes.
+  const std::vector<std::shared_ptr<Folder>>& GetFolders() const { return folders_; }
+
   // --- Path queries ---
   // A full path P lies under a folder with full path F when P + "/" begins
   // with F + "/" (byte for byte): a folder covers itself and what is below
