@@ -83,10 +83,14 @@ std::vector<std::string> IndexMgrEnv::FolderPaths() const {
   return paths;
 }
 
-long long IndexMgrEnv::FoldersFileStamp() const {
-  struct stat st;
-  if (stat(root_.Path("/var/packages/Vellis/etc/fileindex.folders").c_str(), &st) != 0) return 0;
-  return static_cast<long long>(st.st_mtim.tv_sec) * 1000000000LL + st.st_mtim.tv_nsec;
+void IndexMgrEnv::MarkFoldersFile() const {
+  WriteFile(root_.Path("/var/packages/Vellis/etc/fileindex.folders"),
+            " " + JsonToString(FoldersFile()) + "\n");
+}
+
+bool IndexMgrEnv::FoldersFileSaved() const {
+  std::string text = ReadFile(root_.Path("/var/packages/Vellis/etc/fileindex.folders"));
+  return text.empty() || text[0] != ' ';
 }
 
 Json::Value IndexMgrEnv::MonitorQueues() const {

@@ -52,8 +52,11 @@ class IndexMgrEnv {
   // The folders file as saved (null when there is none) and its paths.
   Json::Value FoldersFile() const;
   std::vector<std::string> FolderPaths() const;
-  // Last-write time of the folders file in nanoseconds; 0 when missing.
-  long long FoldersFileStamp() const;
+  // Rewrites the folders file with the same list in another layout (a
+  // leading space), so that FoldersFileSaved() tells whether it was saved
+  // since.
+  void MarkFoldersFile() const;
+  bool FoldersFileSaved() const;
   // The queues registered with the monitor for the application "fileindex"
   // (an object keyed by queue path; null when none was ever written).
   Json::Value MonitorQueues() const;
@@ -68,6 +71,7 @@ class IndexMgrEnv {
   size_t CallCount(const std::string& call) const;
 
   FakeServicesPlatform& platform() { return *platform_; }
+  const FakeServicesPlatform& platform() const { return *platform_; }
   FakeSearchDaemon& search() { return *search_; }
   FakeIndexDaemon& daemon() { return *daemon_; }
   const TempRoot& root() const { return root_; }
