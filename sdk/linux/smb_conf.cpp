@@ -221,7 +221,7 @@ std::string SetIniOption(const std::string& text, const std::string& section,
     out += lines[i].body;
     if (static_cast<long>(i) == anchor) {
       std::string eol = lines[i].ending.empty() ? "\n" : lines[i].ending;
-      out += eol + "\t" + setting + lines[i].ending;
+      out += eol + "\t" + setting + eol;
     } else {
       out += lines[i].ending;
     }
