@@ -16,6 +16,11 @@ int main(int argc, char** argv) {
   vellis::cli::AddQueueCommands(app, ctx);
   vellis::cli::AddShareCommands(app, ctx);
   vellis::cli::AddPathCommands(app, ctx);
+  vellis::cli::AddFolderCommands(app, ctx);
+  vellis::cli::AddShareOpsCommands(app, ctx);
+  vellis::cli::AddVolumeCommands(app, ctx);
+  vellis::cli::AddUserCommands(app, ctx);
+  vellis::cli::AddServicesCommands(app, ctx);
 
   try {
     app.parse(argc, argv);
