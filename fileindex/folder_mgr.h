@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "fileindex/folder.h"
+#include "fileindex/full_path_index.h"
 
 namespace vellis::fileindex {
 
@@ -34,7 +35,9 @@ class FolderMgr {
 
   // Writes the whole list as root, replacing the file atomically (a crash
   // or a full disk leaves the old list or the new one, never a part), then
-  // sets mode 0644. Throws Error 505 (reason the path) when the file cannot
+  // sets mode 0644 and removes temporary files that saves killed before
+  // their rename left behind (those more than a minute older than the new
+  // file). Throws Error 505 (reason the path) when the file cannot
   // be written, 502 (reason the path) when its mode cannot be set, and the
   // credentials' 503.
   void Save() const;
@@ -93,7 +96,9 @@ class FolderMgr {
   // True when `full_path` is itself some entry's full path.
   bool IsFullPathHasOwnCfg(const std::string& full_path) const;
 
-  // True when `full_path` lies under some entry.
+  // True when `full_path` lies under some entry. This and the two below take
+  // a few hash lookups per component of `full_path`, whatever the size of
+  // the list.
   bool IsFullPathIndexed(const std::string& full_path) const;
 
   // The entry that governs `full_path`: the deepest one it lies under (the
@@ -113,7 +118,13 @@ class FolderMgr {
   std::set<std::string> GetIndexedShares() const;
 
  private:
+  // The entries by full path, built on the first path query after a change
+  // of the list (the records' full paths do not change once computed).
+  const FullPathIndex& Index() const;
+  void ListChanged() { index_.reset(); }
+
   std::vector<std::shared_ptr<Folder>> folders_;
+  mutable std::shared_ptr<const FullPathIndex> index_;
 };
 
 }  // namespace vellis::fileindex

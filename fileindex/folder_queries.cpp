@@ -1,21 +1,22 @@
 // The path queries of FolderMgr.
 #include <algorithm>
+#include <utility>
+#include <vector>
 
 #include "fileindex/folder_mgr.h"
 #include "fileindex/util.h"
 
 namespace vellis::fileindex {
-namespace {
 
-// `full_path` + "/" begins with `folder` + "/", without building either
-// string: this runs once per folder for every event of a queue.
-bool IsUnder(const std::string& full_path, const std::string& folder) {
-  return full_path.size() >= folder.size() &&
-         full_path.compare(0, folder.size(), folder) == 0 &&
-         (full_path.size() == folder.size() || full_path[folder.size()] == '/');
+const FullPathIndex& FolderMgr::Index() const {
+  if (!index_) {
+    std::vector<std::string> full_paths;
+    full_paths.reserve(folders_.size());
+    for (const auto& folder : folders_) full_paths.push_back(folder->GetFullPath());
+    index_ = std::make_shared<const FullPathIndex>(std::move(full_paths));
+  }
+  return *index_;
 }
-
-}  // namespace
 
 bool FolderMgr::HasFolder(const std::string& path) const {
   return std::any_of(folders_.begin(), folders_.end(),
@@ -23,28 +24,16 @@ bool FolderMgr::HasFolder(const std::string& path) const {
 }
 
 bool FolderMgr::IsFullPathHasOwnCfg(const std::string& full_path) const {
-  return std::any_of(
-      folders_.begin(), folders_.end(),
-      [&full_path](const std::shared_ptr<Folder>& f) { return f->GetFullPath() == full_path; });
+  return Index().Find(full_path) != FullPathIndex::kNone;
 }
 
 bool FolderMgr::IsFullPathIndexed(const std::string& full_path) const {
-  return std::any_of(
-      folders_.begin(), folders_.end(),
-      [&full_path](const std::shared_ptr<Folder>& f) { return IsUnder(full_path, f->GetFullPath()); });
+  return Index().FindCovering(full_path) != FullPathIndex::kNone;
 }
 
 std::shared_ptr<Folder> FolderMgr::GetMostSuitableCfg(const std::string& full_path) const {
-  std::shared_ptr<Folder> best;
-  size_t best_length = 0;
-  for (const auto& folder : folders_) {
-    const std::string folder_path = folder->GetFullPath();
-    if (IsUnder(full_path, folder_path) && folder_path.size() > best_length) {
-      best = folder;
-      best_length = folder_path.size();
-    }
-  }
-  return best;
+  size_t found = Index().FindCovering(full_path);
+  return found == FullPathIndex::kNone ? nullptr : folders_[found];
 }
 
 bool FolderMgr::IsFullPathNeedMeta(const std::string& full_path) const {

@@ -3,6 +3,7 @@
 #include "common/log.h"
 #include "fileindex/folder.h"
 #include "fileindex/queue_mgr.h"
+#include "fileindex/queue_path_filter.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "sdk/platform.h"
@@ -11,8 +12,15 @@
 namespace vellis::fileindex {
 
 bool Folder::IsIndexing() const {
-  const std::string queue_path = sdk::SDKShare(GetShare()).GetQueuePath();
-  return QueueMgr(queue_path).IsFullPathProcessing(GetFullPath());
+  QueueMgr queue(sdk::SDKShare(GetShare()).GetQueuePath());
+  const std::string full_path = GetFullPath();
+  // Most folders of a listing have nothing waiting; proving that by the
+  // search would parse every queued event once per folder.
+  if (!QueueMayHoldPath(queue.queue_path(), full_path) &&
+      !QueueMayHoldPath(queue.queue_path_tmp(), full_path)) {
+    return false;
+  }
+  return queue.IsFullPathProcessing(full_path);
 }
 
 void Folder::GetStatus(Json::Value& out) const {

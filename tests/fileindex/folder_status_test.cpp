@@ -15,15 +15,10 @@ namespace {
 
 using testing::FolderEnv;
 using testing::MakeDirs;
+using testing::ParseJson;
 using testing::WriteFile;
 
 constexpr int64_t kNow = 1700000000;
-
-Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
-}
 
 class FolderStatusTest : public ::testing::Test {
  protected:
@@ -64,8 +59,7 @@ TEST_F(FolderStatusTest, EachStatusTextInOrderOfPrecedence) {
        "processing"},
       {"resume -1", R"({"resume_time":-1})", EventLine(share_ + "/dir/a"), "", "processing"},
       {"resume 0", R"({"resume_time":0})", EventLine(share_ + "/dir/a"), "", "paused"},
-      {"resume ahead", R"({"resume_time":1700003600})", EventLine(share_ + "/dir/a"), "",
-       "paused"},
+      {"resume ahead", R"({"resume_time":1700003600})", EventLine(share_ + "/dir/a"), "", "paused"},
       {"resume now", R"({"resume_time":1700000000})", EventLine(share_ + "/dir/a"), "",
        "processing"},
       {"resume past", R"({"resume_time":1699999999})", EventLine(share_ + "/dir/a"), "",
@@ -97,7 +91,7 @@ TEST_F(FolderStatusTest, PathThatCannotBeIndexedIsAnErrorWhateverElseHolds) {
 TEST_F(FolderStatusTest, StatusIsTheOnlyAdditionalItem) {
   EXPECT_EQ(dir_.GetDataWithAdditional(Json::Value(Json::arrayValue)), dir_.GetData());
   WriteFile(env_.StatusFile(), R"({"share":{"s":1}})");
-  Json::Value report = dir_.GetDataWithAdditional(Parse(R"(["status"])"));
+  Json::Value report = dir_.GetDataWithAdditional(ParseJson(R"(["status"])"));
   EXPECT_EQ(report["additional"]["status"]["text"], "need_reindex");
   report.removeMember("additional");
   EXPECT_EQ(report, dir_.GetData());
@@ -119,7 +113,7 @@ TEST_F(FolderStatusTest, BadAdditionalsFailTheWholeCall) {
   for (const Case& c : cases) {
     std::string thrown = "no error";
     try {
-      dir_.GetDataWithAdditional(Parse(c.additionals));
+      dir_.GetDataWithAdditional(ParseJson(c.additionals));
     } catch (const Error& e) {
       thrown = std::to_string(e.GetCode()) + " " + e.what();
     }

@@ -15,22 +15,8 @@ namespace vellis::fileindex {
 namespace {
 
 using testing::FolderEnv;
-
-Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
-}
-
-// "<code> <reason>" of the Error that `fn` throws, or "no error".
-std::string Thrown(const std::function<void()>& fn) {
-  try {
-    fn();
-  } catch (const Error& e) {
-    return std::to_string(e.GetCode()) + " " + e.what();
-  }
-  return "no error";
-}
+using testing::ParseJson;
+using testing::Thrown;
 
 constexpr char kMusic[] =
     R"({"path":"/music","name":"music","document":true,"audio":true,"video":false,)"
@@ -51,7 +37,7 @@ TEST(FolderJsonTest, LoadingAndGetDataAreInverses) {
 }
 
 TEST(FolderJsonTest, OptionalKeysDefaultAndAreWrittenBack) {
-  Folder f(Parse(kMusic));
+  Folder f(ParseJson(kMusic));
   EXPECT_FALSE(f.IsPrivileged());
   EXPECT_FALSE(f.IsPaused());
   EXPECT_EQ(f.GetVolumeToBeClean(), "");
@@ -62,7 +48,7 @@ TEST(FolderJsonTest, OptionalKeysDefaultAndAreWrittenBack) {
 
 TEST(FolderJsonTest, MissingRequiredKeyIsRefusedByName) {
   for (const char* key : {"path", "name", "document", "audio", "video", "photo"}) {
-    Json::Value data = Parse(kMusic);
+    Json::Value data = ParseJson(kMusic);
     data.removeMember(key);
     std::string thrown = Thrown([&] { Folder f(data); });
     EXPECT_EQ(thrown.rfind(std::string("120 Missing property: ") + key, 0), 0u)
@@ -76,16 +62,16 @@ TEST(FolderJsonTest, MistypedRequiredKeyOrNonObjectIsRefused) {
     const char* value;
   } cases[] = {{"path", "{}"}, {"name", "[]"}, {"document", R"("yes")"}, {"photo", "{}"}};
   for (const Case& c : cases) {
-    Json::Value data = Parse(kMusic);
-    data[c.key] = Parse(c.value);
+    Json::Value data = ParseJson(kMusic);
+    data[c.key] = ParseJson(c.value);
     std::string thrown = Thrown([&] { Folder f(data); });
     EXPECT_EQ(thrown.substr(0, 4), "120 ") << c.key << "=" << c.value << ": " << thrown;
   }
-  EXPECT_EQ(Thrown([] { Folder f(Parse("[1]")); }).substr(0, 4), "120 ");
+  EXPECT_EQ(Thrown([] { Folder f(ParseJson("[1]")); }).substr(0, 4), "120 ");
 }
 
 TEST(FolderJsonTest, MistypedOptionalKeysKeepTheirDefaults) {
-  Json::Value data = Parse(kMusic);
+  Json::Value data = ParseJson(kMusic);
   data["paused"] = "true";
   data["privileged"] = Json::Value(Json::objectValue);
   data["volume_to_be_clean"] = Json::Value(Json::arrayValue);
@@ -95,12 +81,6 @@ TEST(FolderJsonTest, MistypedOptionalKeysKeepTheirDefaults) {
   EXPECT_FALSE(f.IsPrivileged());
   EXPECT_EQ(f.GetVolumeToBeClean(), "");
   EXPECT_FALSE(f.GetData().isMember("unknown"));
-}
-
-TEST(FolderJsonTest, IndexCfgHoldsOnlyTheFourCategories) {
-  Folder f("/music", "music", true, false, true, false, true, true);
-  EXPECT_EQ(JsonToString(f.GetIndexCfg()),
-            R"({"audio":false,"document":true,"photo":false,"video":true})");
 }
 
 class FolderShareTest : public ::testing::Test {
@@ -117,7 +97,7 @@ TEST_F(FolderShareTest, SetShareReplacesTheFirstWholeShareComponent) {
   } cases[] = {
       {"/music/live", "music", "music2", "/music2/live"},
       {"/music", "music", "tunes", "/tunes"},
-      {"/a/x/a", "a", "b", "/b/x/a"},              // the share name appears twice
+      {"/a/x/a", "a", "b", "/b/x/a"},                // the share name appears twice
       {"/music/music", "music", "m2", "/m2/music"},  // and as a folder below it
   };
   for (const Case& c : cases) {

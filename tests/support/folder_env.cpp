@@ -1,5 +1,10 @@
 #include "tests/support/folder_env.h"
 
+#include <gtest/gtest.h>
+
+#include "common/error.h"
+#include "common/json_util.h"
+
 namespace vellis::testing {
 
 FolderEnv::FolderEnv() : scoped_(&platform_) {}
@@ -24,6 +29,27 @@ std::string FolderEnv::StatusFile() const {
 
 std::string FolderEnv::QueuePath(const std::string& name) const {
   return Volume() + "/@fileindex/" + name + "/queue";
+}
+
+std::shared_ptr<fileindex::Folder> MakeFolder(const std::string& path, const std::string& name,
+                                              bool document, bool audio, bool video, bool photo) {
+  return std::make_shared<fileindex::Folder>(path, name, document, audio, video, photo, false,
+                                             false);
+}
+
+Json::Value ParseJson(const std::string& text) {
+  Json::Value v;
+  EXPECT_TRUE(JsonFromString(v, text)) << text;
+  return v;
+}
+
+std::string Thrown(const std::function<void()>& fn) {
+  try {
+    fn();
+  } catch (const Error& e) {
+    return std::to_string(e.GetCode()) + " " + e.what();
+  }
+  return "no error";
 }
 
 }  // namespace vellis::testing

@@ -2,10 +2,15 @@
 // configuration, folder status and custom events.
 #pragma once
 
+#include <json/json.h>
+
 #include <atomic>
 #include <cstdint>
+#include <functional>
+#include <memory>
 #include <string>
 
+#include "fileindex/folder.h"
 #include "tests/support/fake_share_platform.h"
 #include "tests/support/temp_root.h"
 
@@ -52,5 +57,17 @@ class FolderEnv {
   SleepingSharePlatform platform_;
   ScopedPlatform scoped_;
 };
+
+// A folder record with privileged and paused off.
+std::shared_ptr<fileindex::Folder> MakeFolder(const std::string& path,
+                                              const std::string& name = "n", bool document = true,
+                                              bool audio = true, bool video = true,
+                                              bool photo = true);
+
+// `text` parsed; a failure to parse fails the calling test.
+Json::Value ParseJson(const std::string& text);
+
+// "<code> <reason>" of the vellis::Error that `fn` throws, or "no error".
+std::string Thrown(const std::function<void()>& fn);
 
 }  // namespace vellis::testing
