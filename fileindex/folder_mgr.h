@@ -81,7 +81,9 @@ class FolderMgr {
             const std::string& sort_direction) const;
 
   // The entries in list order. The records are shared with this instance:
-  // changing one changes what Save() writes.
+  // changing one changes what Save() writes. The path queries below do not
+  // see a path changed this way (SetPath, SetShare); such a change is meant
+  // to be saved, and the list loaded afresh before it is queried again.
   const std::vector<std::shared_ptr<Folder>>& GetFolders() const { return folders_; }
 
   // --- Path queries ---
