@@ -37,18 +37,18 @@ void FolderUpsert(const Json::Value& folder_list, bool create, bool updater_mode
   std::set<std::string> shares;
   for (const Json::Value& item : folder_list) {
     auto folder_new = std::make_shared<Folder>(item);
-    VELLIS_THROW_IF(!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode,
-                    kErrPathCannotIndex, "Path cannot index: " + folder_new->GetPath());
+    VELLIS_THROW_IF(!CanPathBeIndexed(folder_new->GetPath()) && !updater_mode, kErrPathCannotIndex,
+                    "Path cannot index: " + folder_new->GetPath());
     VELLIS_THROW_IF(create && folder_mgr.HasFolder(folder_new->GetPath()), kErrFolderDuplicated,
                     "Duplicated ID: " + folder_new->GetPath());
     std::shared_ptr<Folder> changed;
     folder_mgr.Upsert(changed, folder_new);
     // A new folder indexes every category; a changed one only those that
     // differ from what governed its path before.
-    reindex.push_back(create ? std::make_shared<Folder>(folder_new->GetPath(),
-                                                        folder_new->GetName(), true, true, true,
-                                                        true, false, false)
-                             : changed);
+    reindex.push_back(create
+                          ? std::make_shared<Folder>(folder_new->GetPath(), folder_new->GetName(),
+                                                     true, true, true, true, false, false)
+                          : changed);
     sdk::SDKShare share(folder_new->GetShare());
     VELLIS_THROW_IF(!share.IsSpaceEnough(), kErrSpaceNotEnough,
                     "Share (" + share.GetName() + ") space not enough");

@@ -125,8 +125,8 @@ void DeleteQORUNotifydCfg(const std::string& share_name) {
 
 void CleanShareIndexData(const std::string& share_name, const std::string& share_path) {
   char path[kPathBufferSize];
-  VELLIS_THROW_IF(0 > FILEIDXQueuePathCompose(share_path.c_str(), path, sizeof(path)),
-                  kErrInternal, "FILEIDXQueuePathCompose failed, share_path=" + share_path);
+  VELLIS_THROW_IF(0 > FILEIDXQueuePathCompose(share_path.c_str(), path, sizeof(path)), kErrInternal,
+                  "FILEIDXQueuePathCompose failed, share_path=" + share_path);
   RemoveTree(path);
   RemoveTree(std::string(path) + ".tmp");
   VELLIS_THROW_IF(0 > FILEIDXDBPathCompose(share_path.c_str(), path, sizeof(path)), kErrInternal,

@@ -32,9 +32,9 @@ void ShareMigrate(const std::string& share_name, const std::string& old_share_pa
   Json::Value req(Json::objectValue);
   req["share_name"] = share_name;
   SendCommandToDaemon(kCmdWorkerDelete, req);
-  VELLIS_THROW_IF(!sdk::MonitorQueue::Delete(old_queue, kAppName,
-                                             sdk::MONITOR_QUEUE_TYPE_APPLICATION),
-                  kErrInternal, "MonitorQueue::Delete failed, share=" + share_name);
+  VELLIS_THROW_IF(
+      !sdk::MonitorQueue::Delete(old_queue, kAppName, sdk::MONITOR_QUEUE_TYPE_APPLICATION),
+      kErrInternal, "MonitorQueue::Delete failed, share=" + share_name);
   elastic::ShareIndexMigrate(share_name, db_path);
   UpsertQORUNotifydCfg(share_name, folder_mgr);
   SendCommandToDaemon(kCmdWorkerCreate, req);

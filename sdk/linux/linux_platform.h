@@ -76,8 +76,7 @@ class LinuxPlatform : public Platform {
   std::string QLIBCErrorGetFile() override;
   int QLIBCErrorGetLine() override;
   bool MonitorQueueUpsert(const Json::Value& queue, const std::string& app, int type) override;
-  bool MonitorQueueDelete(const std::string& queue_path, const std::string& app,
-                          int type) override;
+  bool MonitorQueueDelete(const std::string& queue_path, const std::string& app, int type) override;
   // (home_recycle.cpp)
   int QORURecycleHomeEnumRecyclePathForAuthType(std::vector<std::string>* paths,
                                                 int auth_type) override;

@@ -87,8 +87,7 @@ bool IsValidMonitorQueue(const Json::Value& queue) {
   return true;
 }
 
-bool LinuxPlatform::MonitorQueueUpsert(const Json::Value& queue, const std::string& app,
-                                       int type) {
+bool LinuxPlatform::MonitorQueueUpsert(const Json::Value& queue, const std::string& app, int type) {
   if (!IsValidMonitorQueue(queue)) return Refuse(EINVAL, __LINE__);
   return UpdateFile(app, type, [&](Json::Value& queues) {
     Json::Value entry(Json::objectValue);

@@ -249,8 +249,8 @@ int Control(const std::string& service, Action action, bool wait) {
   const ServiceMapping* s = FindService(service);
   if (!s) return FailAt(EINVAL, __FILE__, __LINE__);
   if (ServicesDisabled()) {
-    GetPlatform()->Syslog(LOG_NOTICE, std::string("Service ") + ActionName(action) + " " +
-                                          service + " skipped: " + kServicesEnv + "=none");
+    GetPlatform()->Syslog(LOG_NOTICE, std::string("Service ") + ActionName(action) + " " + service +
+                                          " skipped: " + kServicesEnv + "=none");
     return 0;
   }
   if (HasSystemd()) return Systemctl(*s, action, wait);

@@ -38,7 +38,8 @@ std::string Trim(const std::string& s) {
 std::string NormalizeKey(const std::string& s) {
   std::string out;
   for (char c : s) {
-    if (c != ' ' && c != '\t' && c != '\r') out += static_cast<char>(tolower(static_cast<unsigned char>(c)));
+    if (c != ' ' && c != '\t' && c != '\r')
+      out += static_cast<char>(tolower(static_cast<unsigned char>(c)));
   }
   return out;
 }

@@ -132,10 +132,10 @@ TEST_F(FolderOpsTest, TwoFoldersOfOneShareInOneCallShareTheShareSteps) {
 
 TEST_F(FolderOpsTest, SharesAreHandledOnceEachInNameOrder) {
   FolderAdd(Array({F("/photo/a"), F("/music/x"), F("/photo/b")}), false);
-  EXPECT_EQ(env_.SearchCommands(),
-            (std::vector<std::string>{"index_create fileindex_music", "index_create fileindex_photo"}));
+  EXPECT_EQ(env_.SearchCommands(), (std::vector<std::string>{"index_create fileindex_music",
+                                                             "index_create fileindex_photo"}));
   EXPECT_EQ(env_.DaemonCommands(), (std::vector<std::string>{"notify_setting_changed music",
-                                                              "notify_setting_changed photo"}));
+                                                             "notify_setting_changed photo"}));
   EXPECT_EQ(env_.QueueEvents("photo").size(), 2u);
   EXPECT_EQ(env_.QueueEvents("music").size(), 1u);
 }
@@ -209,8 +209,7 @@ TEST_F(FolderOpsTest, RefusedRequestsChangeNothing) {
     bool create;
     std::string error;
   } cases[] = {
-      {"an object instead of a list", F("/photo/a"), true,
-       "120 " + JsonToString(F("/photo/a"))},
+      {"an object instead of a list", F("/photo/a"), true, "120 " + JsonToString(F("/photo/a"))},
       {"a string instead of a list", Json::Value("/photo/a"), true, "120 \"/photo/a\""},
       {"null instead of a list", Json::Value(), false, "120 null"},
       {"an element without a path", Array({Json::Value(Json::objectValue)}), true, ""},
@@ -241,9 +240,9 @@ TEST_F(FolderOpsTest, RefusedRequestsChangeNothing) {
     EXPECT_TRUE(env_.QueueEvents("music2").empty()) << c.what;
   }
   // The element without a path names what it lacks.
-  EXPECT_EQ(ErrorText([&] { FolderAdd(Array({Json::Value(Json::objectValue)}), false); })
-                .substr(0, 30),
-            "120 Missing property: path, da");
+  EXPECT_EQ(
+      ErrorText([&] { FolderAdd(Array({Json::Value(Json::objectValue)}), false); }).substr(0, 30),
+      "120 Missing property: path, da");
 }
 
 TEST_F(FolderOpsTest, AShareShortOfSpaceIsRefusedBeforeAnythingChanges) {
@@ -258,13 +257,12 @@ TEST_F(FolderOpsTest, AShareShortOfSpaceIsRefusedBeforeAnythingChanges) {
 TEST_F(FolderOpsTest, AFailedIndexCreationKeepsEarlierSharesDoneAndTheListUnsaved) {
   env_.search().Push(FakeSearchDaemon::Success());
   env_.search().Push(FakeSearchDaemon::Failure(1234, "no index for you"));
-  std::string error =
-      ErrorText([&] { FolderAdd(Array({F("/photo/a"), F("/music/x")}), false); });
+  std::string error = ErrorText([&] { FolderAdd(Array({F("/photo/a"), F("/music/x")}), false); });
   EXPECT_EQ(error.substr(0, 5), "1234 ") << error;
   EXPECT_TRUE(env_.FoldersFile().isNull()) << "list saved";
   // music (first by name) is done: its index and monitor configuration stay.
   EXPECT_EQ(env_.SearchCommands(), (std::vector<std::string>{"index_create fileindex_music",
-                                                              "index_create fileindex_photo"}));
+                                                             "index_create fileindex_photo"}));
   EXPECT_TRUE(env_.MonitorQueues().isMember(env_.QueuePath("music")));
   EXPECT_FALSE(env_.MonitorQueues().isMember(env_.QueuePath("photo")));
   EXPECT_TRUE(env_.DaemonCommands().empty());
@@ -274,11 +272,13 @@ TEST_F(FolderOpsTest, AFailedIndexCreationKeepsEarlierSharesDoneAndTheListUnsave
 
 TEST_F(FolderOpsTest, AFailedMonitorUpdateLeavesTheListUnsaved) {
   env_.platform().FailCall("MonitorQueueUpsert", EIO, env_.QueuePath("photo"));
-  EXPECT_EQ(ErrorText([&] { FolderAdd(Array({F("/photo/a"), F("/music/x")}), false); }),
+  EXPECT_EQ(ErrorText([&] {
+              FolderAdd(Array({F("/photo/a"), F("/music/x")}), false);
+            }),
             "502 MonitorQueue::Upsert failed, share=photo");
   EXPECT_TRUE(env_.FoldersFile().isNull());
   EXPECT_EQ(env_.SearchCommands(), (std::vector<std::string>{"index_create fileindex_music",
-                                                              "index_create fileindex_photo"}));
+                                                             "index_create fileindex_photo"}));
   EXPECT_TRUE(env_.MonitorQueues().isMember(env_.QueuePath("music")));
   EXPECT_TRUE(env_.DaemonCommands().empty());
   EXPECT_EQ(env_.platform()

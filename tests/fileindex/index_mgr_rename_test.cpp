@@ -52,7 +52,8 @@ TEST_F(RenameOpsTest, UserRenameMovesTheHomeAndWhatIsInsideItOnly) {
   UserRename("alice", "bob");
   EXPECT_EQ(env_.FolderPaths(),
             (std::vector<std::string>{"/homes/bob/docs", "/homes/bob", "/homes/alice2/docs"}));
-  EXPECT_EQ(env_.platform().LogsContaining("Update homes rule: [/homes/alice/docs] -> [/homes/bob/docs]")
+  EXPECT_EQ(env_.platform()
+                .LogsContaining("Update homes rule: [/homes/alice/docs] -> [/homes/bob/docs]")
                 .size(),
             1u);
   EXPECT_EQ(env_.platform().LogsContaining("Update homes rule: [").size(), 2u);
@@ -107,8 +108,8 @@ TEST_F(RenameOpsTest, ShareRenameMovesTheSharesFoldersIndexAndDocuments) {
   const std::string pictures = env_.AddShare("pictures");
 
   ShareRename("photo", "pictures");
-  EXPECT_EQ(env_.FolderPaths(), (std::vector<std::string>{"/pictures/a", "/music/m", "/photo2/c",
-                                                          "/pictures/b"}));
+  EXPECT_EQ(env_.FolderPaths(),
+            (std::vector<std::string>{"/pictures/a", "/music/m", "/photo2/c", "/pictures/b"}));
   std::vector<Json::Value> requests = env_.search().Requests();
   ASSERT_EQ(requests.size(), search_before + 1);
   EXPECT_EQ(requests.back()["command"], "index_config_set");

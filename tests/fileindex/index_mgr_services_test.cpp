@@ -38,20 +38,24 @@ TEST_F(ServicesTest, EnablingAndDisablingFollowTheSearchSwitch) {
     bool spotlight_on;
     std::vector<Call> calls;
   } cases[] = {
-      {true, false,
+      {true,
+       false,
        {{"QORUSMBSetSpotlight", "1"},
         {"QLIBServiceRestart", "samba"},
         {"QLIBServiceStart", "qorucontentextractd"},
         {"QLIBServicectlStart", "pkg-Vellis-fileindexd"}}},
-      {true, true,
+      {true,
+       true,
        {{"QLIBServiceStart", "qorucontentextractd"},
         {"QLIBServicectlStart", "pkg-Vellis-fileindexd"}}},
-      {false, true,
+      {false,
+       true,
        {{"QORUSMBSetSpotlight", "0"},
         {"QLIBServiceRestart", "samba"},
         {"QLIBServiceStop", "qorucontentextractd"},
         {"QLIBServicectlStop", "pkg-Vellis-fileindexd"}}},
-      {false, false,
+      {false,
+       false,
        {{"QLIBServiceStop", "qorucontentextractd"},
         {"QLIBServicectlStop", "pkg-Vellis-fileindexd"}}},
   };
@@ -79,7 +83,8 @@ TEST_F(ServicesTest, EveryStepRunsWhateverTheOneBeforeDid) {
                                {"QLIBServicectlStart", "pkg-Vellis-fileindexd"},
                                {"QLIBServiceStop", "qorucontentextractd"},
                                {"QLIBServicectlStop", "pkg-Vellis-fileindexd"}}));
-  EXPECT_EQ(env_.platform().LogsContaining("QORUSMBSetSpotlight failed: err=[0x0002 smb_conf.cpp:42]")
+  EXPECT_EQ(env_.platform()
+                .LogsContaining("QORUSMBSetSpotlight failed: err=[0x0002 smb_conf.cpp:42]")
                 .size(),
             1u);
   for (const char* condition :
@@ -100,7 +105,8 @@ TEST_F(ServicesTest, AFailedRestartOfTheFileSharingServiceIsLogged) {
 
 TEST_F(ServicesTest, PrepareFollowsWhetherAnyFolderIsListed) {
   PrepareServices();
-  EXPECT_EQ(env_.platform().ServiceCalls().back(), (Call{"QLIBServicectlStop", "pkg-Vellis-fileindexd"}));
+  EXPECT_EQ(env_.platform().ServiceCalls().back(),
+            (Call{"QLIBServicectlStop", "pkg-Vellis-fileindexd"}));
   Json::Value list(Json::arrayValue);
   list.append(IndexMgrEnv::FolderJson("/music/a"));
   FolderAdd(list, false);
@@ -113,7 +119,8 @@ TEST_F(ServicesTest, PrepareFollowsWhetherAnyFolderIsListed) {
   WriteFile(env_.root().Path("/var/packages/Vellis/etc/fileindex.folders"), "{not json");
   env_.platform().ClearServiceCalls();
   PrepareServices();
-  EXPECT_EQ(env_.platform().ServiceCalls().back(), (Call{"QLIBServicectlStop", "pkg-Vellis-fileindexd"}));
+  EXPECT_EQ(env_.platform().ServiceCalls().back(),
+            (Call{"QLIBServicectlStop", "pkg-Vellis-fileindexd"}));
   EXPECT_EQ(env_.platform().LogsContaining("Cannot load folder list, code=504").size(), 1u);
 }
 
@@ -145,8 +152,7 @@ TEST_F(ServicesTest, MonitorChangesOfUnknownSharesOrRefusedByTheMonitorFail) {
     std::function<void()> op;
     std::string error;
   } cases[] = {
-      {"upsert of an unknown share", [] { UpsertQORUNotifydCfg("nosuch", FolderMgr()); },
-       "800 "},
+      {"upsert of an unknown share", [] { UpsertQORUNotifydCfg("nosuch", FolderMgr()); }, "800 "},
       {"delete of an unknown share", [] { DeleteQORUNotifydCfg("nosuch"); }, "800 "},
       {"upsert refused", [] { UpsertQORUNotifydCfg("music", FolderMgr()); },
        "502 MonitorQueue::Upsert failed, share=music"},

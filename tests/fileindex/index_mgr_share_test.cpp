@@ -77,7 +77,7 @@ TEST_F(ShareOpsTest, PauseMarksOnlyTheSharesFoldersAndDropsItsMonitorQueue) {
   env_.MarkFoldersFile();
   SharePause("music");
   EXPECT_EQ(Sent(), (std::vector<std::string>{"worker_delete music", "index_pause fileindex_music",
-                                               "MonitorQueueDelete"}));
+                                              "MonitorQueueDelete"}));
   EXPECT_EQ(Paused(), (std::vector<bool>{true, false, true})) << "music2 is another share";
   EXPECT_TRUE(env_.FoldersFileSaved());
   EXPECT_FALSE(env_.MonitorQueues().isMember(env_.QueuePath("music")));
@@ -100,10 +100,12 @@ TEST_F(ShareOpsTest, PauseIsOrderedDaemonMonitorIndex) {
        },
        {"worker_delete music"},
        false},
-      {"monitor fails", [&] { env_.platform().FailCall("MonitorQueueDelete", EIO); },
+      {"monitor fails",
+       [&] { env_.platform().FailCall("MonitorQueueDelete", EIO); },
        {"worker_delete music", "MonitorQueueDelete"},
        false},
-      {"index fails", [&] { env_.search().Push(FakeSearchDaemon::Failure(77, "no")); },
+      {"index fails",
+       [&] { env_.search().Push(FakeSearchDaemon::Failure(77, "no")); },
        {"worker_delete music", "index_pause fileindex_music", "MonitorQueueDelete"},
        true},
   };
@@ -112,8 +114,7 @@ TEST_F(ShareOpsTest, PauseIsOrderedDaemonMonitorIndex) {
     c.inject();
     EXPECT_NE(ErrorText([] { SharePause("music"); }), "no error") << c.what;
     EXPECT_EQ(Sent(), c.sent) << c.what;
-    EXPECT_EQ(env_.MonitorQueues().isMember(env_.QueuePath("music")), !c.monitor_removed)
-        << c.what;
+    EXPECT_EQ(env_.MonitorQueues().isMember(env_.QueuePath("music")), !c.monitor_removed) << c.what;
     EXPECT_EQ(Paused(), (std::vector<bool>{false, false, false})) << c.what << ": list saved";
     env_.daemon().SetAnswerBytes(std::string("\x10\0\0\0{\"success\":true}", 20));
     env_.daemon().SetCloseAfterAnswer(false);
@@ -131,7 +132,7 @@ TEST_F(ShareOpsTest, ResumeGoesIndexMonitorWorkerAndClearsTheFlags) {
   Reset();
   ShareResume("music");
   EXPECT_EQ(Sent(), (std::vector<std::string>{"worker_create music", "index_resume fileindex_music",
-                                               "MonitorQueueUpsert"}));
+                                              "MonitorQueueUpsert"}));
   EXPECT_EQ(Paused(), (std::vector<bool>{false, false, false}));
   Json::Value config = env_.MonitorQueues()[env_.QueuePath("music")]["config"];
   ASSERT_EQ(config.size(), 2u);
@@ -155,7 +156,7 @@ TEST_F(ShareOpsTest, PausingAPausedShareRepeatsEveryStep) {
   Reset();
   SharePause("music");
   EXPECT_EQ(Sent(), (std::vector<std::string>{"worker_delete music", "index_pause fileindex_music",
-                                               "MonitorQueueDelete"}));
+                                              "MonitorQueueDelete"}));
   EXPECT_EQ(Paused(), (std::vector<bool>{true, false, true}));
 }
 
@@ -174,12 +175,10 @@ TEST_F(ShareOpsTest, ASharesWithoutFoldersOrWithoutANameAreLeftAlone) {
       {"resume without a name", [] { ShareResume(""); }, "120 Missing share name"},
       {"clean-up without a name", [] { ShareClearPaused("", "/volume1/music"); },
        "120 Missing share name"},
-      {"clean-up without a path", [] { ShareClearPaused("music", ""); },
-       "120 Missing share path"},
+      {"clean-up without a path", [] { ShareClearPaused("music", ""); }, "120 Missing share path"},
       {"migrate without a name", [] { ShareMigrate("", "/volume9/music"); },
        "120 Missing share name"},
-      {"migrate without the old path", [] { ShareMigrate("music", ""); },
-       "120 Missing share path"},
+      {"migrate without the old path", [] { ShareMigrate("music", ""); }, "120 Missing share path"},
       {"migrate of an unindexed share", [] { ShareMigrate("photo", "/volume9/photo"); },
        "no error"},
   };
@@ -206,7 +205,8 @@ TEST_F(ShareOpsTest, ClearingAShareRemovesItsDataIndexFoldersAndStatus) {
     removed.push_back(exec.args[1]);
   }
   const std::string data = env_.Volume() + "/@fileindex/music";
-  EXPECT_EQ(removed, (std::vector<std::string>{data + "/queue", data + "/queue.tmp", data + "/db"}));
+  EXPECT_EQ(removed,
+            (std::vector<std::string>{data + "/queue", data + "/queue.tmp", data + "/db"}));
   EXPECT_EQ(Sent(), std::vector<std::string>{"index_delete fileindex_music"});
   EXPECT_EQ(env_.FolderPaths(), std::vector<std::string>{"/music2/c"});
   EXPECT_EQ(StatusMgr().GetShareStatus("music"), 0);
@@ -245,8 +245,8 @@ TEST_F(ShareOpsTest, MigrationMovesTheIndexAndTheMonitorAndQueuesTheMove) {
 
   ShareMigrate("music", old_path);
   EXPECT_EQ(Sent(), (std::vector<std::string>{"worker_delete music", "worker_create music",
-                                               "index_config_set fileindex_music",
-                                               "MonitorQueueDelete", "MonitorQueueUpsert"}));
+                                              "index_config_set fileindex_music",
+                                              "MonitorQueueDelete", "MonitorQueueUpsert"}));
   const Json::Value migrate = env_.search().Requests().back();
   EXPECT_EQ(migrate["data"]["data"]["path"], env_.Volume("volume2") + "/@fileindex/music/db")
       << migrate;

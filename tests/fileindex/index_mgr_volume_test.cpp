@@ -25,8 +25,8 @@ class VolumeOpsTest : public ::testing::Test {
     env_.AddShare("photo", "volume1");
     env_.AddShare("music", "volume1");
     env_.AddShare("video", "volume10");
-    for (const char* dir : {"/volume1/photo/a", "/volume1/photo/b", "/volume1/music/x",
-                            "/volume10/video/v"}) {
+    for (const char* dir :
+         {"/volume1/photo/a", "/volume1/photo/b", "/volume1/music/x", "/volume10/video/v"}) {
       MakeDirs(env_.root().Path(dir));
     }
     Json::Value list(Json::arrayValue);
@@ -59,7 +59,8 @@ class VolumeOpsTest : public ::testing::Test {
     std::vector<std::string> out;
     for (const Json::Value& f : env_.FoldersFile()) {
       std::string volume = f["volume_to_be_clean"].asString();
-      if (volume.rfind(env_.root().path(), 0) == 0) volume = volume.substr(env_.root().path().size());
+      if (volume.rfind(env_.root().path(), 0) == 0)
+        volume = volume.substr(env_.root().path().size());
       out.push_back(f["path"].asString() + " paused=" + (f["paused"].asBool() ? "1" : "0") +
                     " volume=" + volume);
     }
@@ -75,10 +76,10 @@ class VolumeOpsTest : public ::testing::Test {
 
 TEST_F(VolumeOpsTest, PauseMarksTheVolumesFoldersAndStopsEachShareOnce) {
   VolumePause(V1());
-  EXPECT_EQ(Folders(), (std::vector<std::string>{"/photo/a paused=1 volume=/volume1",
-                                                 "/video/v paused=0 volume=",
-                                                 "/photo/b paused=1 volume=/volume1",
-                                                 "/music/x paused=1 volume=/volume1"}));
+  EXPECT_EQ(Folders(), (std::vector<std::string>{
+                           "/photo/a paused=1 volume=/volume1",
+                           "/video/v paused=0 volume=", "/photo/b paused=1 volume=/volume1",
+                           "/music/x paused=1 volume=/volume1"}));
   EXPECT_EQ(NewDaemon(), (std::vector<std::string>{"worker_delete music", "worker_delete photo"}));
   EXPECT_EQ(NewSearch(), (std::vector<std::string>{"index_pause fileindex_music",
                                                    "index_pause fileindex_photo"}));
@@ -109,10 +110,10 @@ TEST_F(VolumeOpsTest, ResumeBringsBackPausedFoldersAndKeepsTheVolume) {
   VolumePause(V1());
   Reset();
   VolumeResume(V1());
-  EXPECT_EQ(Folders(), (std::vector<std::string>{"/photo/a paused=0 volume=/volume1",
-                                                 "/video/v paused=0 volume=",
-                                                 "/photo/b paused=0 volume=/volume1",
-                                                 "/music/x paused=0 volume=/volume1"}));
+  EXPECT_EQ(Folders(), (std::vector<std::string>{
+                           "/photo/a paused=0 volume=/volume1",
+                           "/video/v paused=0 volume=", "/photo/b paused=0 volume=/volume1",
+                           "/music/x paused=0 volume=/volume1"}));
   EXPECT_EQ(NewSearch(), (std::vector<std::string>{"index_resume fileindex_music",
                                                    "index_resume fileindex_photo"}));
   EXPECT_EQ(NewDaemon(), (std::vector<std::string>{"worker_create music", "worker_create photo"}));
@@ -123,8 +124,7 @@ TEST_F(VolumeOpsTest, ResumeRecreatesTheWorkerBeforeTheMonitor) {
   VolumePause(V1());
   Reset();
   env_.platform().FailCall("MonitorQueueUpsert", EIO);
-  EXPECT_EQ(ErrorText([&] { VolumeResume(V1()); }),
-            "502 MonitorQueue::Upsert failed, share=music");
+  EXPECT_EQ(ErrorText([&] { VolumeResume(V1()); }), "502 MonitorQueue::Upsert failed, share=music");
   EXPECT_EQ(NewSearch(), std::vector<std::string>{"index_resume fileindex_music"});
   EXPECT_EQ(NewDaemon(), std::vector<std::string>{"worker_create music"});
   EXPECT_EQ(Folders()[3], "/music/x paused=0 volume=/volume1") << "saved first";

@@ -86,12 +86,11 @@ TEST_F(ServicesTest, WithServicesOffEveryRequestIsOnlyLogged) {
   EXPECT_EQ(linux_.QLIBServicectlStart("pkg-Vellis-fileindexd", kServicectlUpstart), 0);
   EXPECT_EQ(linux_.QLIBServicectlStop("pkg-Vellis-fileindexd", kServicectlUpstart), 0);
   EXPECT_TRUE(fake_.Execs().empty());
-  for (const char* line :
-       {"Service start qorucontentextractd skipped: VELLIS_SERVICES=none",
-        "Service stop qorucontentextractd skipped: VELLIS_SERVICES=none",
-        "Service restart samba skipped: VELLIS_SERVICES=none",
-        "Service start pkg-Vellis-fileindexd skipped: VELLIS_SERVICES=none",
-        "Service stop pkg-Vellis-fileindexd skipped: VELLIS_SERVICES=none"}) {
+  for (const char* line : {"Service start qorucontentextractd skipped: VELLIS_SERVICES=none",
+                           "Service stop qorucontentextractd skipped: VELLIS_SERVICES=none",
+                           "Service restart samba skipped: VELLIS_SERVICES=none",
+                           "Service start pkg-Vellis-fileindexd skipped: VELLIS_SERVICES=none",
+                           "Service stop pkg-Vellis-fileindexd skipped: VELLIS_SERVICES=none"}) {
     EXPECT_EQ(fake_.LogsContaining(line).size(), 1u) << line;
   }
   // An unknown name is refused all the same.

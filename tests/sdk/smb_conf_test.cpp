@@ -114,8 +114,9 @@ TEST_F(SmbConfPlatformTest, SwitchingRewritesOnlyTheOptionAndKeepsTheMode) {
   EXPECT_EQ(linux_.QORUSMBIsEnableSpotlight(), 0);
   ASSERT_EQ(linux_.QORUSMBSetSpotlight(1), 0);
   EXPECT_EQ(linux_.QORUSMBIsEnableSpotlight(), 1);
-  EXPECT_EQ(ReadFile(Conf()),
-            "# site settings\n[global]\n\tworkgroup = HOME\n\tspotlight = yes\n[data]\n\tpath = /d\n");
+  EXPECT_EQ(
+      ReadFile(Conf()),
+      "# site settings\n[global]\n\tworkgroup = HOME\n\tspotlight = yes\n[data]\n\tpath = /d\n");
   struct stat st;
   ASSERT_EQ(stat(Conf().c_str(), &st), 0);
   EXPECT_EQ(st.st_mode & 07777, 0640u);

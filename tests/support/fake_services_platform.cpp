@@ -116,14 +116,14 @@ bool FakeServicesPlatform::MonitorQueueUpsert(const Json::Value& queue, const st
   return FakeSharePlatform::MonitorQueueUpsert(queue, app, type);
 }
 
-bool FakeServicesPlatform::MonitorQueueDelete(const std::string& queue_path,
-                                              const std::string& app, int type) {
+bool FakeServicesPlatform::MonitorQueueDelete(const std::string& queue_path, const std::string& app,
+                                              int type) {
   if (Fails("MonitorQueueDelete", queue_path)) return false;
   return FakeSharePlatform::MonitorQueueDelete(queue_path, app, type);
 }
 
-int FakeServicesPlatform::QORURecycleHomeEnumRecyclePathForAuthType(
-    std::vector<std::string>* paths, int auth_type) {
+int FakeServicesPlatform::QORURecycleHomeEnumRecyclePathForAuthType(std::vector<std::string>* paths,
+                                                                    int auth_type) {
   bool fails = Fails("QORURecycleHomeEnumRecyclePathForAuthType", "");
   std::lock_guard<std::mutex> lock(mu_);
   auth_types_.push_back(auth_type);

@@ -56,8 +56,7 @@ class FakeServicesPlatform : public FakeSharePlatform {
   // Scripted failures ("MonitorQueueUpsert" / "MonitorQueueDelete", with the
   // queue path as argument) answer false; the others write the file.
   bool MonitorQueueUpsert(const Json::Value& queue, const std::string& app, int type) override;
-  bool MonitorQueueDelete(const std::string& queue_path, const std::string& app,
-                          int type) override;
+  bool MonitorQueueDelete(const std::string& queue_path, const std::string& app, int type) override;
   int QORURecycleHomeEnumRecyclePathForAuthType(std::vector<std::string>* paths,
                                                 int auth_type) override;
   int QORURecycleHomeEnumRecyclePath(std::vector<std::string>* paths) override;

@@ -57,8 +57,8 @@ std::vector<Json::Value> IndexMgrEnv::QueueEvents(const std::string& name) const
   return events;
 }
 
-Json::Value IndexMgrEnv::FolderJson(const std::string& path, bool document, bool audio,
-                                    bool video, bool photo) {
+Json::Value IndexMgrEnv::FolderJson(const std::string& path, bool document, bool audio, bool video,
+                                    bool photo) {
   Json::Value f(Json::objectValue);
   f["path"] = path;
   f["name"] = path.substr(path.rfind('/') + 1);

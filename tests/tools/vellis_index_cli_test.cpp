@@ -95,8 +95,8 @@ TEST_F(IndexCliTest, FoldersAreAddedListedReadAndDeleted) {
   EXPECT_EQ(Vellis("folder reindex /photo/a").out, "queued reindex of 1 folder\n");
   EXPECT_EQ(Vellis("folder list").out.find("/photo/b"), std::string::npos);
   EXPECT_EQ(DaemonCommands(), (std::vector<std::string>{"notify_setting_changed photo",
-                                                         "notify_setting_changed music",
-                                                         "notify_setting_changed photo"}));
+                                                        "notify_setting_changed music",
+                                                        "notify_setting_changed photo"}));
 }
 
 TEST_F(IndexCliTest, FoldersCanComeAsJsonForScripts) {

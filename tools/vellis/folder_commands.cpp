@@ -66,12 +66,9 @@ Json::Value FolderListFromArgs(const FolderArgs& args) {
 }
 
 std::vector<std::string> FolderRow(const Json::Value& f, bool status) {
-  std::vector<std::string> row = {f["path"].asString(),
-                                  f["name"].asString(),
-                                  YesNo(f["document"].asBool()),
-                                  YesNo(f["audio"].asBool()),
-                                  YesNo(f["video"].asBool()),
-                                  YesNo(f["photo"].asBool()),
+  std::vector<std::string> row = {f["path"].asString(),          f["name"].asString(),
+                                  YesNo(f["document"].asBool()), YesNo(f["audio"].asBool()),
+                                  YesNo(f["video"].asBool()),    YesNo(f["photo"].asBool()),
                                   YesNo(f["paused"].asBool())};
   if (status) {
     const Json::Value& s = f["additional"]["status"];
@@ -123,8 +120,7 @@ void AddFolderCommands(CLI::App& app, Context& ctx) {
   CLI::App* list = group->add_subcommand("list", "List the indexed folders");
   list->add_option("--offset", list_args->offset, "Skip this many folders");
   list->add_option("--limit", list_args->limit, "Show at most this many")->capture_default_str();
-  list->add_option("--sort-by", list_args->sort_by,
-                   "path, name, document, audio, video or photo")
+  list->add_option("--sort-by", list_args->sort_by, "path, name, document, audio, video or photo")
       ->capture_default_str();
   list->add_flag("--desc", list_args->desc, "Reverse the order");
   list->add_flag("--status", list_args->status, "Show each folder's indexing status");
@@ -169,8 +165,7 @@ void AddFolderCommands(CLI::App& app, Context& ctx) {
 
   auto delete_args = std::make_shared<FolderArgs>();
   CLI::App* del = group->add_subcommand(
-      "delete",
-      "Stop indexing a folder; the share's index is dropped with its last folder");
+      "delete", "Stop indexing a folder; the share's index is dropped with its last folder");
   del->add_option("PATH", delete_args->paths, "Share path of the folder")->required()->expected(1);
   del->callback([&ctx, delete_args] {
     ctx.action = [delete_args] {
@@ -180,8 +175,7 @@ void AddFolderCommands(CLI::App& app, Context& ctx) {
   });
 
   auto reindex_args = std::make_shared<FolderArgs>();
-  CLI::App* reindex =
-      group->add_subcommand("reindex", "Index indexed folders again from scratch");
+  CLI::App* reindex = group->add_subcommand("reindex", "Index indexed folders again from scratch");
   reindex->add_option("PATH", reindex_args->paths, "Share paths of the folders")->required();
   reindex->callback([&ctx, reindex_args] {
     ctx.action = [reindex_args] {

@@ -46,8 +46,7 @@ void AddShareOpsCommands(CLI::App& app, Context& ctx) {
   });
 
   CLI::App* clear = share->add_subcommand(
-      "clear",
-      "Forget a share that is gone for good: its queue, index data, index and folders");
+      "clear", "Forget a share that is gone for good: its queue, index data, index and folders");
   clear->add_option("NAME", args->name, "Share name")->required();
   clear->add_option("SHARE_PATH", args->other, "The share's full path (/volume1/photo)")
       ->required();
@@ -76,8 +75,7 @@ void AddShareOpsCommands(CLI::App& app, Context& ctx) {
       "After a share moved to another volume: move its index and monitoring to the new "
       "place and queue the move and a reindex of its folders");
   migrate->add_option("NAME", args->name, "Share name")->required();
-  migrate->add_option("OLD_PATH", args->other, "The share's full path before the move")
-      ->required();
+  migrate->add_option("OLD_PATH", args->other, "The share's full path before the move")->required();
   migrate->callback([&ctx, args] {
     ctx.action = [args] {
       fileindex::ShareMigrate(args->name, args->other);

@@ -63,8 +63,7 @@ void AddUserCommands(CLI::App& app, Context& ctx) {
 }
 
 void AddServicesCommands(CLI::App& app, Context& ctx) {
-  CLI::App* services =
-      app.add_subcommand("services", "The services that indexing needs");
+  CLI::App* services = app.add_subcommand("services", "The services that indexing needs");
   services->require_subcommand(1);
   CLI::App* prepare = services->add_subcommand(
       "prepare",
