@@ -130,16 +130,6 @@ TEST_F(FolderOpsTest, TwoFoldersOfOneShareInOneCallShareTheShareSteps) {
   EXPECT_EQ(events[1]["path"], Full("/photo/b"));
 }
 
-TEST_F(FolderOpsTest, SharesAreHandledOnceEachInNameOrder) {
-  FolderAdd(Array({F("/photo/a"), F("/music/x"), F("/photo/b")}), false);
-  EXPECT_EQ(env_.SearchCommands(), (std::vector<std::string>{"index_create fileindex_music",
-                                                             "index_create fileindex_photo"}));
-  EXPECT_EQ(env_.DaemonCommands(), (std::vector<std::string>{"notify_setting_changed music",
-                                                             "notify_setting_changed photo"}));
-  EXPECT_EQ(env_.QueueEvents("photo").size(), 2u);
-  EXPECT_EQ(env_.QueueEvents("music").size(), 1u);
-}
-
 TEST_F(FolderOpsTest, OnlyTheFirstFolderOfAShareCreatesItsIndex) {
   Given(Array({F("/photo/a")}));
   FolderAdd(Array({F("/photo/b")}), false);
@@ -239,19 +229,16 @@ TEST_F(FolderOpsTest, RefusedRequestsChangeNothing) {
     EXPECT_TRUE(env_.QueueEvents("photo").empty()) << c.what;
     EXPECT_TRUE(env_.QueueEvents("music2").empty()) << c.what;
   }
+  env_.platform().SetQuota(false, sdk::kPlatformErrNoSpace);
+  EXPECT_EQ(ErrorText([&] { FolderAdd(Array({F("/photo/a")}), false); }),
+            "1003 Share (photo) space not enough");
+  EXPECT_FALSE(env_.FoldersFileSaved());
+  EXPECT_TRUE(env_.platform().ServiceCalls().empty());
+  EXPECT_EQ(NewSearchCommands(), std::vector<std::string>{});
   // The element without a path names what it lacks.
   EXPECT_EQ(
       ErrorText([&] { FolderAdd(Array({Json::Value(Json::objectValue)}), false); }).substr(0, 30),
       "120 Missing property: path, da");
-}
-
-TEST_F(FolderOpsTest, AShareShortOfSpaceIsRefusedBeforeAnythingChanges) {
-  env_.platform().SetQuota(false, sdk::kPlatformErrNoSpace);
-  EXPECT_EQ(ErrorText([&] { FolderAdd(Array({F("/photo/a")}), false); }),
-            "1003 Share (photo) space not enough");
-  EXPECT_TRUE(env_.FoldersFile().isNull());
-  EXPECT_TRUE(env_.SearchCommands().empty());
-  EXPECT_TRUE(env_.platform().ServiceCalls().empty());
 }
 
 TEST_F(FolderOpsTest, AFailedIndexCreationKeepsEarlierSharesDoneAndTheListUnsaved) {
@@ -297,31 +284,11 @@ TEST_F(FolderOpsTest, AnUnreachableDaemonLeavesTheListSavedAndNothingQueued) {
   EXPECT_TRUE(env_.QueueEvents("photo").empty());
 }
 
-TEST_F(FolderOpsTest, FailingServicesAreLoggedAndTheAddGoesOn) {
-  env_.platform().FailCall("QLIBServiceStart", ENOENT);
-  env_.platform().FailCall("QLIBServicectlStart", ENOENT);
+TEST_F(FolderOpsTest, AnEventThatCannotBeQueuedFlagsTheShareForAReindex) {
+  MakeDirs(env_.QueuePath("photo"));  // a queue that cannot be appended to
   FolderAdd(Array({F("/photo/a")}), false);
   EXPECT_EQ(env_.FolderPaths(), std::vector<std::string>{"/photo/a"});
-  EXPECT_EQ(env_.platform()
-                .LogsContaining("Failed [0 > QLIBServiceStart(\"qorucontentextractd\", TRUE)]")
-                .size(),
-            1u);
-  EXPECT_EQ(env_.platform()
-                .LogsContaining("Failed [0 > QLIBServicectlStart(\"pkg-Vellis-fileindexd\", "
-                                "QLIB_SERVICECTL_UPSTART)]")
-                .size(),
-            1u);
-}
-
-TEST_F(FolderOpsTest, AShareWhoseNameIsAPrefixOfAnotherKeepsItsOwnMonitorConfiguration) {
-  env_.AddShare("music2");
-  MakeDirs(env_.Volume() + "/music2/y");
-  FolderAdd(Array({F("/music/x"), F("/music2/y")}), false);
-  Json::Value monitor = env_.MonitorQueues();
-  ASSERT_EQ(monitor[env_.QueuePath("music")]["config"].size(), 1u) << monitor;
-  EXPECT_EQ(monitor[env_.QueuePath("music")]["config"][0]["path"], Full("/music/x"));
-  ASSERT_EQ(monitor[env_.QueuePath("music2")]["config"].size(), 1u) << monitor;
-  EXPECT_EQ(monitor[env_.QueuePath("music2")]["config"][0]["path"], Full("/music2/y"));
+  EXPECT_EQ(StatusMgr().GetShareStatus("photo"), kShareStatusNeedReindex);
 }
 
 TEST_F(FolderOpsTest, ListPagesAndCountsEveryFolder) {

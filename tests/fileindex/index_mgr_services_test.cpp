@@ -96,13 +96,6 @@ TEST_F(ServicesTest, EveryStepRunsWhateverTheOneBeforeDid) {
   }
 }
 
-TEST_F(ServicesTest, AFailedRestartOfTheFileSharingServiceIsLogged) {
-  env_.platform().FailCall("QLIBServiceRestart", EIO);
-  SetupRelatedServices(true);
-  EXPECT_TRUE(env_.platform().Spotlight());
-  EXPECT_EQ(env_.platform().LogsContaining("QLIBServiceRestart failed: err=[0x0005").size(), 1u);
-}
-
 TEST_F(ServicesTest, PrepareFollowsWhetherAnyFolderIsListed) {
   PrepareServices();
   EXPECT_EQ(env_.platform().ServiceCalls().back(),

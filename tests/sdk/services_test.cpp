@@ -54,29 +54,6 @@ class ServicesTest : public ::testing::Test {
   LinuxPlatform linux_;
 };
 
-TEST_F(ServicesTest, TheAppliancesNamesMapToOurs) {
-  struct Case {
-    const char* service;
-    const char* unit;
-    const char* program;
-  } cases[] = {
-      {"samba", "smbd.service", nullptr},
-      {"qorucontentextractd", "vellis-extractd.service", "vellis-extractd"},
-      {"pkg-Vellis-fileindexd", "vellis-fileindexd.service", "vellis-fileindexd"},
-  };
-  for (const Case& c : cases) {
-    const ServiceMapping* m = FindService(c.service);
-    ASSERT_NE(m, nullptr) << c.service;
-    EXPECT_STREQ(m->unit, c.unit);
-    EXPECT_EQ(m->program == nullptr, c.program == nullptr);
-    if (c.program) {
-      EXPECT_STREQ(m->program, c.program);
-    }
-  }
-  EXPECT_EQ(FindService("sshd"), nullptr);
-  EXPECT_EQ(FindService("Samba"), nullptr);
-}
-
 TEST_F(ServicesTest, WithServicesOffEveryRequestIsOnlyLogged) {
   ScopedEnv off(kServicesEnv, "none");
   MakeDirs(root_.Path(kSystemdRunDir));
