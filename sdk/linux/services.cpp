@@ -135,6 +135,14 @@ int Spawn(const std::string& path) {
       if (write(pipe_fds[1], report, sizeof(report)) < 0) _exit(1);
       _exit(0);
     }
+    // A daemon starts with default signal handling, whatever this process
+    // ignores or blocks (SIGPIPE is often ignored here).
+    struct sigaction dfl = {};
+    dfl.sa_handler = SIG_DFL;
+    for (int sig = 1; sig < NSIG; ++sig) sigaction(sig, &dfl, nullptr);
+    sigset_t none;
+    sigemptyset(&none);
+    sigprocmask(SIG_SETMASK, &none, nullptr);
     int null_fd = open("/dev/null", O_RDWR);
     if (null_fd >= 0) {
       dup2(null_fd, STDIN_FILENO);

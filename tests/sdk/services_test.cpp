@@ -129,10 +129,18 @@ class OwnDaemonTest : public ServicesTest {
 };
 
 TEST_F(OwnDaemonTest, StartRunsTheProgramOnceAndStopEndsIt) {
-  ASSERT_EQ(linux_.QLIBServicectlStart("pkg-Vellis-fileindexd", kServicectlUpstart), 0);
+  // What this process ignores is not passed on to the daemon.
+  struct sigaction ignore = {}, old = {};
+  ignore.sa_handler = SIG_IGN;
+  sigaction(SIGTERM, &ignore, &old);
+  int started = linux_.QLIBServicectlStart("pkg-Vellis-fileindexd", kServicectlUpstart);
+  sigaction(SIGTERM, &old, nullptr);
+  ASSERT_EQ(started, 0);
   int pid = RunningServicePid("vellis-fileindexd");
   ASSERT_GT(pid, 0);
   EXPECT_EQ(kill(pid, 0), 0);
+  std::string status = testing::ReadFile("/proc/" + std::to_string(pid) + "/status");
+  EXPECT_NE(status.find("SigIgn:\t0000000000000000\n"), std::string::npos) << status;
   EXPECT_EQ(linux_.QLIBServicectlStart("pkg-Vellis-fileindexd", kServicectlUpstart), 0);
   EXPECT_EQ(RunningServicePid("vellis-fileindexd"), pid) << "started twice";
 
