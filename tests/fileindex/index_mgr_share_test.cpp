@@ -223,6 +223,14 @@ TEST_F(ShareOpsTest, ClearingAShareRemovesItsDataIndexFoldersAndStatus) {
                                {"QLIBServicectlStop", "pkg-Vellis-fileindexd"}}));
 }
 
+TEST_F(ShareOpsTest, AShareGoneFromThePlatformIsClearedAllTheSame) {
+  env_.platform().RemoveShare("music");
+  EXPECT_EQ(ErrorText([] { FolderDelete("/music/a"); }).substr(0, 4), "800 ");
+  ShareClearPaused("music", env_.Volume() + "/music");
+  EXPECT_EQ(env_.FolderPaths(), std::vector<std::string>{"/music2/c"});
+  EXPECT_EQ(Sent(), std::vector<std::string>{"index_delete fileindex_music"});
+}
+
 TEST_F(ShareOpsTest, AClearThatCannotComposeItsPathsStopsThere) {
   const std::string share_path = env_.Volume() + "/music";
   env_.platform().FailCall("FILEIDXDBPathCompose", EINVAL, share_path);
