@@ -108,7 +108,7 @@ bool WritePidFile(const std::string& program, int pid, unsigned long long start_
 }
 
 std::string ServiceLockPath(const std::string& program) {
-  return RootPath("/tmp/vellis_service_" + program + ".lock");
+  return RootPath(kServiceLockPrefix + program + ".lock");
 }
 
 // Runs `path` detached: a grandchild in a session of its own, standard

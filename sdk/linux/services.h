@@ -22,6 +22,7 @@ inline constexpr char kDaemonDirEnv[] = "VELLIS_DAEMON_DIR";
 // Fixed paths, resolved with RootPath() at use.
 inline constexpr char kSystemdRunDir[] = "/run/systemd/system";
 inline constexpr char kServicePidDir[] = "/var/run/vellis";
+inline constexpr char kServiceLockPrefix[] = "/tmp/vellis_service_";
 inline constexpr char kSambaInitScript[] = "/etc/init.d/smbd";
 inline constexpr char kSystemctlProgram[] = "/bin/systemctl";
 

@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "common/fs_util.h"
+#include "common/root_path.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "tests/support/index_mgr_env.h"
@@ -109,7 +110,7 @@ TEST_F(ServicesTest, PrepareFollowsWhetherAnyFolderIsListed) {
             (Call{"QLIBServicectlStart", "pkg-Vellis-fileindexd"}));
 
   // A list that cannot be read counts as empty, and is logged.
-  WriteFile(env_.root().Path("/var/packages/Vellis/etc/fileindex.folders"), "{not json");
+  WriteFile(RootPath(kFileIndexFoldersCfgPath), "{not json");
   env_.platform().ClearServiceCalls();
   PrepareServices();
   EXPECT_EQ(env_.platform().ServiceCalls().back(),

@@ -95,7 +95,7 @@ TEST_F(MonitorQueuesTest, BadRequestsAreRefusedAndWriteNothing) {
   }
   EXPECT_FALSE(linux_.MonitorQueueDelete("relative", "fileindex", 1));
   EXPECT_EQ(MonitorQueueFile("../etc"), "");
-  EXPECT_TRUE(ReadFile(root_.Path("/var/packages/Vellis/etc/monitor/fileindex.json")).empty());
+  EXPECT_TRUE(ReadFile(MonitorQueueFile("fileindex")).empty());
 }
 
 TEST_F(MonitorQueuesTest, ACorruptFileIsNeverOverwritten) {

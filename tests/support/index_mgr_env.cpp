@@ -9,6 +9,7 @@
 #include "common/root_path.h"
 #include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/communication.h"
+#include "fileindex/folder_mgr.h"
 #include "sdk/linux/monitor_queues.h"
 
 namespace vellis::testing {
@@ -71,7 +72,7 @@ Json::Value IndexMgrEnv::FolderJson(const std::string& path, bool document, bool
 
 Json::Value IndexMgrEnv::FoldersFile() const {
   Json::Value v;
-  if (!JsonFromFile(v, root_.Path("/var/packages/Vellis/etc/fileindex.folders"))) {
+  if (!JsonFromFile(v, RootPath(fileindex::kFileIndexFoldersCfgPath))) {
     return Json::Value();
   }
   return v;
@@ -84,12 +85,12 @@ std::vector<std::string> IndexMgrEnv::FolderPaths() const {
 }
 
 void IndexMgrEnv::MarkFoldersFile() const {
-  WriteFile(root_.Path("/var/packages/Vellis/etc/fileindex.folders"),
+  WriteFile(RootPath(fileindex::kFileIndexFoldersCfgPath),
             " " + JsonToString(FoldersFile()) + "\n");
 }
 
 bool IndexMgrEnv::FoldersFileSaved() const {
-  std::string text = ReadFile(root_.Path("/var/packages/Vellis/etc/fileindex.folders"));
+  std::string text = ReadFile(RootPath(fileindex::kFileIndexFoldersCfgPath));
   return text.empty() || text[0] != ' ';
 }
 
