@@ -84,6 +84,13 @@ class Folder {
   bool IsPaused() const { return paused_; }
 
   void SetPaused(bool paused) { paused_ = paused; }
+  // Replaces the path; the share and full path are computed afresh on next
+  // use.
+  void SetPath(const std::string& path) {
+    path_ = path;
+    share_.clear();
+    full_path_.clear();
+  }
   void SetVolumeToBeClean(const std::string& volume) { volume_to_be_clean_ = volume; }
 
   // Equal in the nine stored fields; the caches do not count.

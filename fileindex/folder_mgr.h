@@ -80,6 +80,12 @@ class FolderMgr {
             unsigned int limit, const std::string& sort_by,
             const std::string& sort_direction) const;
 
+  // The entries in list order. The records are shared with this instance:
+  // changing one changes what Save() writes. The path queries below do not
+  // see a path changed this way (SetPath, SetShare); such a change is meant
+  // to be saved, and the list loaded afresh before it is queried again.
+  const std::vector<std::shared_ptr<Folder>>& GetFolders() const { return folders_; }
+
   // --- Path queries ---
   // A full path P lies under a folder with full path F when P + "/" begins
   // with F + "/" (byte for byte): a folder covers itself and what is below

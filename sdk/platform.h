@@ -100,6 +100,18 @@ enum ExecOption : int {
   kExecStderrToNull = 0x02,  // its standard error goes to /dev/null
 };
 
+// Sources of user accounts (the AUTH_TYPE of the home-folder hooks).
+enum AuthType : int {
+  kAuthLocal = 1,   // the system's own users
+  kAuthDomain = 2,  // users of a Windows domain
+  kAuthLdap = 3,    // users of a directory server
+};
+
+// Service controllers of QLIBServicectlStart and QLIBServicectlStop.
+enum ServicectlType : int {
+  kServicectlUpstart = 1,  // the package's job of the init system
+};
+
 // Permission bits reported by QORUACLPermGet.
 enum AclPerm : int {
   kAclExecute = 1,
@@ -236,6 +248,50 @@ class Platform {
   // (errno says why). Implementations may also throw; callers treat that as
   // a failure.
   virtual int ParseFile(const std::string& path, const Json::Value& options, Json::Value* doc) = 0;
+
+  // --- Services and monitor ---
+  // Services are named as on the appliance ("samba", "qorucontentextractd",
+  // "pkg-Vellis-fileindexd"); docs/platform.md says what each one is here.
+  // Start / stop / restart `service`. With `wait`, return once it runs / has
+  // ended. 0 on success, also when it already ran / was not running;
+  // negative on failure (an unknown service or a program that is not
+  // installed included), with QLIBCErrGet saying why.
+  virtual int QLIBServiceStart(const std::string& service, bool wait) = 0;
+  virtual int QLIBServiceStop(const std::string& service, bool wait) = 0;
+  virtual int QLIBServiceRestart(const std::string& service) = 0;
+  // The same for a package's own service run by the service controller
+  // `type` (ServicectlType); they return once the controller has acted.
+  virtual int QLIBServicectlStart(const std::string& service, int type) = 0;
+  virtual int QLIBServicectlStop(const std::string& service, int type) = 0;
+  // 1 when the file-sharing service's search support (its "spotlight"
+  // option) is on; 0 when it is off, unset, or the service is not configured
+  // at all.
+  virtual int QORUSMBIsEnableSpotlight() = 0;
+  // Switches that support on (`enable` 1) or off (0). 0 on success; negative
+  // on failure (no configuration to change included), with QLIBCErrGet
+  // saying why. The service itself is not restarted.
+  virtual int QORUSMBSetSpotlight(int enable) = 0;
+  // The source file (basename) and line at which the calling thread's last
+  // platform failure was detected; "" and 0 when the platform did not record
+  // them.
+  virtual std::string QLIBCErrorGetFile() = 0;
+  virtual int QLIBCErrorGetLine() = 0;
+  // Enters or replaces, in the file-change monitor's configuration, the
+  // queue `queue` of application `app` with queue type `type`: `queue` is
+  // {"queue": <queue file>, "config": [{"path": <full path>, "mask": <int>,
+  // "ignore": [<name>...]}...]}. True on success.
+  virtual bool MonitorQueueUpsert(const Json::Value& queue, const std::string& app, int type) = 0;
+  // Removes the queue `queue_path` of `app`; true on success, also when it
+  // was not configured.
+  virtual bool MonitorQueueDelete(const std::string& queue_path, const std::string& app,
+                                  int type) = 0;
+  // Appends to *paths the recycle-bin folder ("<home>/#recycle") of every
+  // home folder in the "homes" share: of the users of the account source
+  // `auth_type` (AuthType) / of all users, in name order. 0 on success;
+  // negative when there is no "homes" share or it cannot be listed.
+  virtual int QORURecycleHomeEnumRecyclePathForAuthType(std::vector<std::string>* paths,
+                                                        int auth_type) = 0;
+  virtual int QORURecycleHomeEnumRecyclePath(std::vector<std::string>* paths) = 0;
 };
 
 // The process's platform. Never null: the Linux platform until replaced.
@@ -356,6 +412,40 @@ class PlatformWrapper : public Platform {
   }
   int ParseFile(const std::string& path, const Json::Value& options, Json::Value* doc) override {
     return target_->ParseFile(path, options, doc);
+  }
+
+  int QLIBServiceStart(const std::string& service, bool wait) override {
+    return target_->QLIBServiceStart(service, wait);
+  }
+  int QLIBServiceStop(const std::string& service, bool wait) override {
+    return target_->QLIBServiceStop(service, wait);
+  }
+  int QLIBServiceRestart(const std::string& service) override {
+    return target_->QLIBServiceRestart(service);
+  }
+  int QLIBServicectlStart(const std::string& service, int type) override {
+    return target_->QLIBServicectlStart(service, type);
+  }
+  int QLIBServicectlStop(const std::string& service, int type) override {
+    return target_->QLIBServicectlStop(service, type);
+  }
+  int QORUSMBIsEnableSpotlight() override { return target_->QORUSMBIsEnableSpotlight(); }
+  int QORUSMBSetSpotlight(int enable) override { return target_->QORUSMBSetSpotlight(enable); }
+  std::string QLIBCErrorGetFile() override { return target_->QLIBCErrorGetFile(); }
+  int QLIBCErrorGetLine() override { return target_->QLIBCErrorGetLine(); }
+  bool MonitorQueueUpsert(const Json::Value& queue, const std::string& app, int type) override {
+    return target_->MonitorQueueUpsert(queue, app, type);
+  }
+  bool MonitorQueueDelete(const std::string& queue_path, const std::string& app,
+                          int type) override {
+    return target_->MonitorQueueDelete(queue_path, app, type);
+  }
+  int QORURecycleHomeEnumRecyclePathForAuthType(std::vector<std::string>* paths,
+                                                int auth_type) override {
+    return target_->QORURecycleHomeEnumRecyclePathForAuthType(paths, auth_type);
+  }
+  int QORURecycleHomeEnumRecyclePath(std::vector<std::string>* paths) override {
+    return target_->QORURecycleHomeEnumRecyclePath(paths);
   }
 
  private:

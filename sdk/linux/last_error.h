@@ -11,6 +11,10 @@ void SetPlatformError(int err);
 int PlatformError();
 
 // Records `err` and returns -1: the failure result of most platform calls.
+// The failure site is forgotten.
 int FailWith(int err);
+// FailWith that also records where the failure was detected, for
+// QLIBCErrorGetFile / QLIBCErrorGetLine: FailAt(err, __FILE__, __LINE__).
+int FailAt(int err, const char* file, int line);
 
 }  // namespace vellis::sdk

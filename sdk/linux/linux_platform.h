@@ -63,6 +63,24 @@ class LinuxPlatform : public Platform {
 
   // In sdk/linux/content_extract.cpp.
   int ParseFile(const std::string& path, const Json::Value& options, Json::Value* doc) override;
+
+  // --- Services and monitor (services.cpp, smb_conf.cpp, monitor_queues.cpp;
+  // the failure site in last_error.cpp) ---
+  int QLIBServiceStart(const std::string& service, bool wait) override;
+  int QLIBServiceStop(const std::string& service, bool wait) override;
+  int QLIBServiceRestart(const std::string& service) override;
+  int QLIBServicectlStart(const std::string& service, int type) override;
+  int QLIBServicectlStop(const std::string& service, int type) override;
+  int QORUSMBIsEnableSpotlight() override;
+  int QORUSMBSetSpotlight(int enable) override;
+  std::string QLIBCErrorGetFile() override;
+  int QLIBCErrorGetLine() override;
+  bool MonitorQueueUpsert(const Json::Value& queue, const std::string& app, int type) override;
+  bool MonitorQueueDelete(const std::string& queue_path, const std::string& app, int type) override;
+  // (home_recycle.cpp)
+  int QORURecycleHomeEnumRecyclePathForAuthType(std::vector<std::string>* paths,
+                                                int auth_type) override;
+  int QORURecycleHomeEnumRecyclePath(std::vector<std::string>* paths) override;
 };
 
 }  // namespace vellis::sdk

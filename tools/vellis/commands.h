@@ -22,5 +22,13 @@ void AddPathCommands(CLI::App& app, Context& ctx);
 void AddSearchCommands(CLI::App& app, Context& ctx);
 // `vellis index load`: fills a share's index through the library's requests.
 void AddIndexCommands(CLI::App& app, Context& ctx);
+// Index management: folders, the index side of shares (added to the `share`
+// group, so AddShareCommands comes first), volumes, users and homes, and the
+// related services.
+void AddFolderCommands(CLI::App& app, Context& ctx);
+void AddShareOpsCommands(CLI::App& app, Context& ctx);
+void AddVolumeCommands(CLI::App& app, Context& ctx);
+void AddUserCommands(CLI::App& app, Context& ctx);
+void AddServicesCommands(CLI::App& app, Context& ctx);
 
 }  // namespace vellis::cli

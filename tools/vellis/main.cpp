@@ -19,6 +19,11 @@ int main(int argc, char** argv) {
   vellis::cli::AddPathCommands(app, ctx);
   vellis::cli::AddSearchCommands(app, ctx);
   vellis::cli::AddIndexCommands(app, ctx);
+  vellis::cli::AddFolderCommands(app, ctx);
+  vellis::cli::AddShareOpsCommands(app, ctx);
+  vellis::cli::AddVolumeCommands(app, ctx);
+  vellis::cli::AddUserCommands(app, ctx);
+  vellis::cli::AddServicesCommands(app, ctx);
 
   try {
     app.parse(argc, argv);
