@@ -1,7 +1,6 @@
 // The index management commands of `vellis`, run as a user runs them,
 // against fake daemons on the test root's sockets and with services off.
 #include <gtest/gtest.h>
-#include <sys/wait.h>
 
 #include <cstdio>
 #include <cstdlib>
@@ -12,32 +11,13 @@
 #include "common/root_path.h"
 #include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/communication.h"
+#include "tests/support/cli_runner.h"
 #include "tests/support/fake_index_daemon.h"
 #include "tests/support/fake_search_daemon.h"
 #include "tests/support/temp_root.h"
 
 namespace vellis::testing {
 namespace {
-
-struct CliRun {
-  int status;
-  std::string out;
-};
-
-// The built `vellis` with `args` (shell words, quoted by the caller), stdout
-// and stderr together.
-CliRun Vellis(const std::string& args) {
-  const char* dir = getenv("VELLIS_TEST_BINARY_DIR");
-  std::string bin = std::string(dir ? dir : ".") + "/tools/vellis/vellis";
-  FILE* p = popen((bin + " " + args + " 2>&1").c_str(), "r");
-  CliRun r{-1, ""};
-  if (!p) return r;
-  char buf[4096];
-  for (size_t n; (n = fread(buf, 1, sizeof(buf), p)) > 0;) r.out.append(buf, n);
-  int status = pclose(p);
-  r.status = WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-  return r;
-}
 
 class IndexCliTest : public ::testing::Test {
  protected:
