@@ -7,9 +7,12 @@
 #include "common/error.h"
 #include "fileindex/util.h"
 #include "tests/support/fake_share_platform.h"
+#include "tests/support/thrown.h"
 
 namespace vellis::fileindex {
 namespace {
+
+using testing::Thrown;
 
 using testing::FakeSharePlatform;
 using testing::ScopedPlatform;
@@ -29,15 +32,6 @@ class SharePathTest : public ::testing::Test {
     platform_.AddShare(music);
   }
 
-  // "<code> <reason>" of the Error that `fn` throws.
-  static std::string Thrown(const std::function<void()>& fn) {
-    try {
-      fn();
-    } catch (const Error& e) {
-      return std::to_string(e.GetCode()) + " " + e.what();
-    }
-    return "no error";
-  }
 
   FakeSharePlatform platform_;
   ScopedPlatform scoped_;

@@ -14,9 +14,12 @@
 #include "tests/support/fake_index_daemon.h"
 #include "tests/support/fake_share_platform.h"
 #include "tests/support/temp_root.h"
+#include "tests/support/thrown.h"
 
 namespace vellis::fileindex {
 namespace {
+
+using testing::Thrown;
 
 using testing::ReadFile;
 using testing::WriteFile;
@@ -34,15 +37,6 @@ class StatusMgrTest : public ::testing::Test {
   std::string StatusPath() const { return RootPath(kFileIndexStatusCfgPath); }
   Json::Value StatusFile() const { return Parse(ReadFile(StatusPath())); }
 
-  // "<code> <reason>" of the Error that `fn` throws.
-  std::string Thrown(const std::function<void()>& fn) {
-    try {
-      fn();
-    } catch (const Error& e) {
-      return std::to_string(e.GetCode()) + " " + e.what();
-    }
-    return "no error";
-  }
 
   testing::TempRoot root_;
   testing::FakeSharePlatform platform_;

@@ -9,9 +9,12 @@
 
 #include "common/error.h"
 #include "tests/support/fake_share_platform.h"
+#include "tests/support/thrown.h"
 
 namespace vellis::sdk {
 namespace {
+
+using testing::Thrown;
 
 using testing::FakeSharePlatform;
 using testing::ScopedPlatform;
@@ -30,16 +33,6 @@ class ShareTest : public ::testing::Test {
     platform_.AddShare(ro);
   }
 
-  // Runs `fn`, which must throw; returns the Error's code and reason as
-  // "<code> <reason>".
-  std::string Thrown(const std::function<void()>& fn) {
-    try {
-      fn();
-    } catch (const Error& e) {
-      return std::to_string(e.GetCode()) + " " + e.what();
-    }
-    return "no error";
-  }
 
   FakeSharePlatform platform_;
   ScopedPlatform scoped_;

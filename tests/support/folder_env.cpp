@@ -43,13 +43,4 @@ Json::Value ParseJson(const std::string& text) {
   return v;
 }
 
-std::string Thrown(const std::function<void()>& fn) {
-  try {
-    fn();
-  } catch (const Error& e) {
-    return std::to_string(e.GetCode()) + " " + e.what();
-  }
-  return "no error";
-}
-
 }  // namespace vellis::testing

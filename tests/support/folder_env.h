@@ -13,6 +13,7 @@
 #include "fileindex/folder.h"
 #include "tests/support/fake_share_platform.h"
 #include "tests/support/temp_root.h"
+#include "tests/support/thrown.h"
 
 namespace vellis::testing {
 
@@ -66,8 +67,5 @@ std::shared_ptr<fileindex::Folder> MakeFolder(const std::string& path,
 
 // `text` parsed; a failure to parse fails the calling test.
 Json::Value ParseJson(const std::string& text);
-
-// "<code> <reason>" of the vellis::Error that `fn` throws, or "no error".
-std::string Thrown(const std::function<void()>& fn);
 
 }  // namespace vellis::testing
