@@ -39,22 +39,16 @@ class ShareOpsTest : public ::testing::Test {
     Reset();
   }
 
-  // Forgets what the set-up sent and called.
-  void Reset() {
-    search_before_ = env_.SearchCommands().size();
-    daemon_before_ = env_.DaemonCommands().size();
-    env_.platform().ClearCalls();
-    env_.platform().ClearServiceCalls();
-  }
+  void Reset() { env_.ForgetSent(); }
 
   // Everything that the operation did, in order of the pieces: daemon
   // commands, then search requests, then monitor calls.
   std::vector<std::string> Sent() const {
     std::vector<std::string> out;
-    std::vector<std::string> daemon = env_.DaemonCommands();
-    out.insert(out.end(), daemon.begin() + static_cast<long>(daemon_before_), daemon.end());
-    std::vector<std::string> search = env_.SearchCommands();
-    out.insert(out.end(), search.begin() + static_cast<long>(search_before_), search.end());
+    std::vector<std::string> daemon = env_.NewDaemonCommands();
+    out.insert(out.end(), daemon.begin(), daemon.end());
+    std::vector<std::string> search = env_.NewSearchCommands();
+    out.insert(out.end(), search.begin(), search.end());
     for (const std::string& call : env_.platform().Calls()) {
       if (call.rfind("MonitorQueue", 0) == 0) out.push_back(call);
     }
@@ -69,8 +63,6 @@ class ShareOpsTest : public ::testing::Test {
   }
 
   IndexMgrEnv env_;
-  size_t search_before_ = 0;
-  size_t daemon_before_ = 0;
 };
 
 TEST_F(ShareOpsTest, PauseMarksOnlyTheSharesFoldersAndDropsItsMonitorQueue) {

@@ -37,21 +37,9 @@ class VolumeOpsTest : public ::testing::Test {
     Reset();
   }
 
-  void Reset() {
-    search_before_ = env_.SearchCommands().size();
-    daemon_before_ = env_.DaemonCommands().size();
-    env_.platform().ClearCalls();
-    env_.platform().ClearServiceCalls();
-  }
-
-  std::vector<std::string> NewSearch() const {
-    std::vector<std::string> all = env_.SearchCommands();
-    return {all.begin() + static_cast<long>(search_before_), all.end()};
-  }
-  std::vector<std::string> NewDaemon() const {
-    std::vector<std::string> all = env_.DaemonCommands();
-    return {all.begin() + static_cast<long>(daemon_before_), all.end()};
-  }
+  void Reset() { env_.ForgetSent(); }
+  std::vector<std::string> NewSearch() const { return env_.NewSearchCommands(); }
+  std::vector<std::string> NewDaemon() const { return env_.NewDaemonCommands(); }
 
   // "<path> paused=<0|1> volume=<volume_to_be_clean relative to the root>"
   // per folder, in list order.
@@ -70,8 +58,6 @@ class VolumeOpsTest : public ::testing::Test {
   std::string V1() const { return env_.Volume("volume1"); }
 
   IndexMgrEnv env_;
-  size_t search_before_ = 0;
-  size_t daemon_before_ = 0;
 };
 
 TEST_F(VolumeOpsTest, PauseMarksTheVolumesFoldersAndStopsEachShareOnce) {

@@ -122,6 +122,23 @@ std::vector<std::string> IndexMgrEnv::DaemonCommands() const {
 
 std::vector<Json::Value> IndexMgrEnv::DaemonCommandObjects() const { return daemon_->Commands(); }
 
+void IndexMgrEnv::ForgetSent() {
+  search_forgotten_ = SearchCommands().size();
+  daemon_forgotten_ = DaemonCommands().size();
+  platform_->ClearCalls();
+  platform_->ClearServiceCalls();
+}
+
+std::vector<std::string> IndexMgrEnv::NewSearchCommands() const {
+  std::vector<std::string> all = SearchCommands();
+  return {all.begin() + static_cast<long>(search_forgotten_), all.end()};
+}
+
+std::vector<std::string> IndexMgrEnv::NewDaemonCommands() const {
+  std::vector<std::string> all = DaemonCommands();
+  return {all.begin() + static_cast<long>(daemon_forgotten_), all.end()};
+}
+
 size_t IndexMgrEnv::CallCount(const std::string& call) const {
   size_t n = 0;
   for (const std::string& c : platform_->Calls()) n += c == call;

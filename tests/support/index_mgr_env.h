@@ -67,6 +67,13 @@ class IndexMgrEnv {
   // has no share name), and the commands themselves.
   std::vector<std::string> DaemonCommands() const;
   std::vector<Json::Value> DaemonCommandObjects() const;
+  // Forgets what was sent and called so far (the set-up's own requests):
+  // the New* lists below start again, and the platform's recorded calls
+  // and service calls are cleared.
+  void ForgetSent();
+  // SearchCommands() / DaemonCommands() since the last ForgetSent().
+  std::vector<std::string> NewSearchCommands() const;
+  std::vector<std::string> NewDaemonCommands() const;
   // How often the platform call `call` was made.
   size_t CallCount(const std::string& call) const;
 
@@ -83,6 +90,8 @@ class IndexMgrEnv {
   std::unique_ptr<FakeSearchDaemon> search_;
   std::unique_ptr<FakeIndexDaemon> daemon_;
   std::map<std::string, std::string> share_volumes_;
+  size_t search_forgotten_ = 0;
+  size_t daemon_forgotten_ = 0;
 };
 
 }  // namespace vellis::testing
