@@ -433,7 +433,10 @@ TEST_F(FolderOpsTest, BadReindexRequestsChangeNothing) {
   EXPECT_EQ(env_.QueueEvents("photo").size(), 1u);
 }
 
-TEST_F(FolderOpsTest, TwoProcessesAddingAtOnceBothEndUpInTheList) {
+// Disabled: a child forked while the fake daemons' threads run can deadlock on a
+// lock held at fork time (seen once under the sanitizer build). Run it by hand
+// with --gtest_also_run_disabled_tests until the children exec a helper.
+TEST_F(FolderOpsTest, DISABLED_TwoProcessesAddingAtOnceBothEndUpInTheList) {
   env_.platform().SetRealUSleep(20);
   constexpr int kFolders = 6;
   for (int i = 0; i < kFolders; ++i) MakeDirs(env_.Volume() + "/photo/p" + std::to_string(i));
