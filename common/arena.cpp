@@ -1,7 +1,5 @@
 #include "common/arena.h"
 
-#include "common/large_alloc.h"
-
 #include <algorithm>
 #include <cstdint>
 #include <cstdlib>
@@ -14,14 +12,14 @@ namespace {
 // little, and double up to a size at which one more block is cheap next to
 // what is already held.
 constexpr size_t kFirstBlock = 4096;
-constexpr size_t kLargestBlock = kHugePageBytes;
+constexpr size_t kLargestBlock = 1u << 20;
 
 }  // namespace
 
 Arena* Arena::New() { return new Arena(); }
 
 Arena::~Arena() {
-  for (char* b : blocks_) FreeLarge(b);
+  for (char* b : blocks_) free(b);
 }
 
 void Arena::Unref() {
@@ -34,7 +32,7 @@ void* Arena::Allocate(size_t bytes, size_t align) {
     size_t size = blocks_.empty() ? kFirstBlock : std::min(kLargestBlock, 2 * (block_bytes_));
     size = std::max(size, bytes);  // an outsized object gets a block of its own
     blocks_.reserve(blocks_.size() + 1);
-    char* block = static_cast<char*>(AllocateLarge(size));  // aligned for any object
+    char* block = static_cast<char*>(malloc(size));  // aligned for any object
     if (block == nullptr) throw std::bad_alloc();
     blocks_.push_back(block);
     block_bytes_ += size;
