@@ -216,7 +216,9 @@ OPTree::OPTree(const std::string& path)
   try {
     BuildTree();
   } catch (...) {
-    Clear();  // no destructor runs for a tree whose constructor throws
+    // No destructor runs for a tree whose constructor throws.
+    Clear();
+    arena_->Unref();
     throw;
   }
 }
