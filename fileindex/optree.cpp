@@ -4,9 +4,11 @@
 #include <cstring>
 #include <functional>
 
+#include "common/arena.h"
 #include "common/json_util.h"
 #include "common/line_reader.h"
 #include "common/log.h"
+#include "fileindex/child_index.h"
 
 namespace vellis::fileindex {
 namespace {
@@ -57,15 +59,83 @@ bool HasCarriableWork(const OPNode& node) {
 
 }  // namespace
 
-Event::Event(const std::string& event_raw) {
+Event::Event(const std::string& event_raw) { Assign(event_raw); }
+
+namespace {
+
+// The members of a queue line that an event reads, found in one walk over
+// the object.
+struct EventMembers {
+  const Json::Value* event = nullptr;
+  const Json::Value* is_dir = nullptr;
+  const Json::Value* path = nullptr;
+  const Json::Value* path_old = nullptr;
+  const Json::Value* data = nullptr;
+};
+
+EventMembers FindEventMembers(const Json::Value& root) {
+  EventMembers m;
+  for (auto it = root.begin(); it != root.end(); ++it) {
+    const char* end = nullptr;
+    const char* name = it.memberName(&end);
+    const std::string_view key(name, static_cast<size_t>(end - name));
+    if (key == "path") {
+      m.path = &*it;
+    } else if (key == "event") {
+      m.event = &*it;
+    } else if (key == "is_dir") {
+      m.is_dir = &*it;
+    } else if (key == "path_old") {
+      m.path_old = &*it;
+    } else if (key == "data") {
+      m.data = &*it;
+    }
+  }
+  return m;
+}
+
+// Copies a string member into `out`'s existing storage; a member that the
+// JSON helpers would convert (null, a number, a boolean) is converted as
+// they do.
+bool AssignString(std::string& out, const Json::Value* v) {
+  const char* begin = nullptr;
+  const char* end = nullptr;
+  if (v == nullptr) return false;
+  if (v->getString(&begin, &end)) {
+    out.assign(begin, static_cast<size_t>(end - begin));
+    return true;
+  }
+  if (!v->isConvertibleTo(Json::stringValue)) return false;
+  out = v->asString();
+  return true;
+}
+
+}  // namespace
+
+void Event::Assign(const std::string& event_raw) {
   Json::Value root;
   VELLIS_THROW_IF(!JsonFromString(root, event_raw), kErrMalformedEvent,
                   "Malformed event_raw: " + event_raw);
-  GetJsonValue(event, root, "event", true);
-  GetJsonValue(is_dir, root, "is_dir", false);
-  GetJsonValue(path, root, "path", true);
-  GetJsonValue(path_old, root, "path_old", false);
-  GetJsonValue(data, root, "data", false);
+  // A queue round reads a million lines: the members are found in one walk
+  // and read in place. Whatever the walk cannot take (not an object, a
+  // missing or mistyped required member) goes to the JSON helper, which
+  // throws its usual error.
+  EventMembers m;
+  if (root.isObject()) m = FindEventMembers(root);
+  if (m.event != nullptr && m.event->isConvertibleTo(Json::uintValue)) {
+    event = m.event->asUInt();
+  } else {
+    GetJsonValue(event, root, "event", true);
+  }
+  is_dir = m.is_dir != nullptr && m.is_dir->isConvertibleTo(Json::booleanValue) &&
+           m.is_dir->asBool();
+  if (!AssignString(path, m.path)) GetJsonValue(path, root, "path", true);
+  if (!AssignString(path_old, m.path_old)) path_old.clear();
+  if (m.data != nullptr) {
+    data = *m.data;
+  } else {
+    data = Json::Value();
+  }
 }
 
 OP::OP(std::shared_ptr<OPNode> node, FileIndexOP op, const std::string& path_old,
@@ -101,10 +171,34 @@ std::string OPNode::GetPath() const {
   return path;
 }
 
-std::shared_ptr<OPNode> OPNode::GetChild(const std::string& child_name) {
-  for (const auto& c : children) {
-    if (c->name == child_name) return c;
+OPNode::~OPNode() = default;
+
+// Up to this many children, a scan beats an index: names are short and the
+// children of a small folder sit close together.
+constexpr size_t kScannedChildren = 8;
+
+OPNode* OPNode::FindChild(std::string_view child_name) {
+  if (!child_index_) {
+    if (children.size() <= kScannedChildren) {
+      for (const auto& c : children) {
+        if (c->name == child_name) return c.get();
+      }
+      return nullptr;
+    }
+    child_index_ = std::make_unique<ChildIndex>();
   }
+  // Children appended since the last lookup join the index; a repeated name
+  // keeps its first child.
+  for (; child_index_->indexed < children.size(); ++child_index_->indexed) {
+    OPNode* c = children[child_index_->indexed].get();
+    const uint32_t hash = ChildIndex::Hash(c->name);
+    if (child_index_->Find(c->name, hash) == nullptr) child_index_->Insert(c, hash);
+  }
+  return child_index_->Find(child_name, ChildIndex::Hash(child_name));
+}
+
+std::shared_ptr<OPNode> OPNode::GetChild(const std::string& child_name) {
+  if (OPNode* c = FindChild(child_name)) return c->shared_from_this();
   children.push_back(std::make_shared<OPNode>(shared_from_this(), child_name));
   return children.back();
 }
@@ -115,98 +209,31 @@ void OPNode::TraverseOP(const std::function<void(std::shared_ptr<OP>)>& fn) {
   for (size_t i = 0, n = ops.size(); i < n; ++i) fn(ops[i]);
 }
 
-namespace {
-
-// Slots tag the unused top 16 bits of a user-space pointer.
-static_assert(sizeof(uintptr_t) == 8, "the path index tags 64-bit pointers");
-constexpr int kTagShift = 48;
-constexpr uintptr_t kPointerMask = (uintptr_t{1} << kTagShift) - 1;
-
-// Whether the node's full path is `path`, compared component by component
-// up the parent chain.
-bool PathEquals(const OPNode* n, std::string_view path) {
-  size_t end = path.size();
-  for (; n->parent; n = n->parent.get()) {
-    const size_t len = n->name.size();
-    if (end < len + 1 || path[end - len - 1] != '/' ||
-        memcmp(path.data() + end - len, n->name.data(), len) != 0) {
-      return false;
-    }
-    end -= len + 1;
-  }
-  return end == 0;
-}
-
-}  // namespace
-
-uint32_t OPTree::PathIndex::Hash(std::string_view path) {
-  uint64_t h = std::hash<std::string_view>()(path);
-  h ^= h >> 33;
-  h *= 0xff51afd7ed558ccdULL;
-  h ^= h >> 33;
-  return static_cast<uint32_t>(h);
-}
-
-// The slot tag: 16 bits of the hash, mixed apart from the low bits that pick
-// the slot.
-uintptr_t OPTree::PathIndex::Tag(uint32_t hash) {
-  return static_cast<uintptr_t>((hash * 0x9E3779B1u) >> 16) << kTagShift;
-}
-
-OPNode* OPTree::PathIndex::Find(std::string_view path, uint32_t hash) const {
-  if (slots_.empty()) return nullptr;
-  const size_t mask = slots_.size() - 1;
-  const uintptr_t tag = Tag(hash);
-  for (size_t i = hash & mask;; i = (i + 1) & mask) {
-    const uintptr_t slot = slots_[i];
-    if (slot == 0) return nullptr;
-    if ((slot & ~kPointerMask) == tag) {
-      OPNode* n = reinterpret_cast<OPNode*>(slot & kPointerMask);
-      if (PathEquals(n, path)) return n;
-    }
-  }
-}
-
-void OPTree::PathIndex::Insert(OPNode* node, uint32_t hash) {
-  // Linear probing stays short below three quarters full, and the tags
-  // spare most probes a visit to the node.
-  if ((used_ + 1) * 4 > slots_.size() * 3) {
-    std::vector<uintptr_t> old;
-    old.swap(slots_);
-    slots_.assign(old.empty() ? 1024 : old.size() * 2, 0);
-    used_ = 0;
-    for (uintptr_t slot : old) {
-      if (slot != 0) {
-        OPNode* n = reinterpret_cast<OPNode*>(slot & kPointerMask);
-        Insert(n, n->path_hash_);
-      }
-    }
-  }
-  node->path_hash_ = hash;
-  const size_t mask = slots_.size() - 1;
-  size_t i = hash & mask;
-  while (slots_[i] != 0) i = (i + 1) & mask;
-  slots_[i] = Tag(hash) | (reinterpret_cast<uintptr_t>(node) & kPointerMask);
-  ++used_;
-}
-
 OPTree::OPTree(const std::string& path)
-    : queue_path(path), root(std::make_shared<OPNode>(nullptr, std::string())) {
+    : queue_path(path),
+      root(std::make_shared<OPNode>(nullptr, std::string())),
+      arena_(Arena::New()) {
   try {
     BuildTree();
   } catch (...) {
-    Clear();  // no destructor runs for a tree whose constructor throws
+    // No destructor runs for a tree whose constructor throws.
+    Clear();
+    arena_->Unref();
     throw;
   }
 }
 
-OPTree::~OPTree() { Clear(); }
+OPTree::~OPTree() {
+  Clear();
+  arena_->Unref();  // the memory goes once no caller holds an operation
+}
 
 void OPTree::Clear() {
   // Break every downward link first, collecting the nodes breadth first
   // (ancestors before descendants), then release them from the back, so
   // that no destructor recurses down or up a long chain. Parent links stay:
   // an operation kept by a caller still knows its path.
+  spare_op_.reset();
   std::vector<std::shared_ptr<OPNode>> nodes;
   if (root) nodes.push_back(std::move(root));
   for (size_t i = 0; i < nodes.size(); ++i) {
@@ -217,6 +244,7 @@ void OPTree::Clear() {
   }
   ops.clear();
   while (!nodes.empty()) nodes.pop_back();
+  last_dir_ = nullptr;
 }
 
 void OPTree::BuildTree() {
@@ -225,6 +253,7 @@ void OPTree::BuildTree() {
                   std::string("Failed to open queue, reason=") + strerror(errno));
   std::string_view line;
   std::string raw;  // reused: one line at a time, no allocation per line
+  auto event = std::make_shared<Event>();  // likewise; InsertEvent keeps no reference
   for (;;) {
     LineReader::Status status = reader.Next(&line);
     if (status == LineReader::Status::kEnd) break;
@@ -238,7 +267,8 @@ void OPTree::BuildTree() {
     }
     VELLIS_LOG_DEBUG("Got event: %s", raw.c_str());
     try {
-      InsertEvent(std::make_shared<Event>(raw));
+      event->Assign(raw);
+      InsertEvent(event);
     } catch (const Error& e) {
       VELLIS_LOG_ERRNO("InsertEvent failed, event_raw=%s, code=%d, reason=%s", raw.c_str(),
                        static_cast<int>(e.GetCode()), e.what());
@@ -249,52 +279,28 @@ void OPTree::BuildTree() {
 
 std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
   VELLIS_THROW_IF(!IsCanonicalPath(path), kErrNodeByPath, "GetNodeByPath failed, path=" + path);
-  const uint32_t hash = PathIndex::Hash(path);
-  if (OPNode* n = index_.Find(path, hash)) return n->shared_from_this();
-  // Find the deepest ancestor that exists, then create the rest below it.
-  OPNode* node = root.get();
-  size_t start = 1;
-  for (size_t cut = path.rfind('/'); cut > 0; cut = path.rfind('/', cut - 1)) {
-    std::string_view prefix(path.data(), cut);
-    if (OPNode* n = index_.Find(prefix, PathIndex::Hash(prefix))) {
-      node = n;
-      start = cut + 1;
-      break;
+  const size_t cut = path.rfind('/');
+  const std::string_view dir(path.data(), cut);
+  OPNode* parent = last_dir_;
+  if (parent == nullptr || dir != last_dir_path_) {
+    parent = root.get();
+    for (size_t start = 1; start < cut;) {
+      const size_t end = path.find('/', start);
+      parent = ChildOf(parent, std::string_view(path.data() + start, end - start));
+      start = end + 1;
     }
+    last_dir_ = parent;
+    last_dir_path_.assign(dir);
   }
-  bool found_unindexed = false;
-  while (start <= path.size()) {
-    size_t end = path.find('/', start);
-    if (end == std::string::npos) end = path.size();
-    const std::string_view prefix(path.data(), end);
-    const uint32_t prefix_hash = end == path.size() ? hash : PathIndex::Hash(prefix);
-    // A child made with OPNode::GetChild is not in the index yet; it must be
-    // found, not made a second time. Once such children were indexed, the
-    // rest of the path may exist below them.
-    if (IndexNewChildren(node)) found_unindexed = true;
-    OPNode* child = found_unindexed ? index_.Find(prefix, prefix_hash) : nullptr;
-    if (child == nullptr) {
-      node->children.push_back(std::make_shared<OPNode>(
-          node->shared_from_this(), std::string(path.data() + start, end - start)));
-      child = node->children.back().get();
-      index_.Insert(child, prefix_hash);
-      node->indexed_children_ = node->children.size();
-    }
-    node = child;
-    start = end + 1;
-  }
-  return node->shared_from_this();
+  return ChildOf(parent, std::string_view(path.data() + cut + 1, path.size() - cut - 1))
+      ->shared_from_this();
 }
 
-bool OPTree::IndexNewChildren(OPNode* node) {
-  bool added = false;
-  for (; node->indexed_children_ < node->children.size(); ++node->indexed_children_) {
-    OPNode* child = node->children[node->indexed_children_].get();
-    index_.Insert(child, PathIndex::Hash(child->GetPath()));
-    IndexNewChildren(child);
-    added = true;
-  }
-  return added;
+OPNode* OPTree::ChildOf(OPNode* node, std::string_view name) {
+  if (OPNode* child = node->FindChild(name)) return child;
+  node->children.push_back(std::allocate_shared<OPNode>(
+      ArenaAllocator<OPNode>(arena_), node->shared_from_this(), std::string(name)));
+  return node->children.back().get();
 }
 
 void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,
@@ -317,6 +323,22 @@ unsigned int OPTree::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& f
   return static_cast<unsigned int>(ops.size());
 }
 
+std::shared_ptr<OP> OPTree::NewOp(const std::shared_ptr<OPNode>& node) {
+  // Most lines of a busy queue merge into work already pending, and their
+  // operation is never attached: the next line reuses it rather than leave
+  // it unused in the arena.
+  if (spare_op_ && spare_op_.use_count() == 1) {
+    spare_op_->node = node;
+    spare_op_->op = FILE_INDEX_OP_NONE;
+    spare_op_->path_old.clear();
+    spare_op_->data = Json::Value();
+  } else {
+    spare_op_ =
+        std::allocate_shared<OP>(ArenaAllocator<OP>(arena_), node, FILE_INDEX_OP_NONE, "", Json::Value());
+  }
+  return spare_op_;
+}
+
 void OPTree::Attach(const std::shared_ptr<OP>& op) {
   ops.push_back(op);
   op->node->ops.push_back(op);
@@ -326,7 +348,7 @@ void OPTree::InsertEvent(std::shared_ptr<Event> event) {
   std::shared_ptr<OPNode> node = GetNodeByPath(event->path);
   // One operation object serves every bit of the line; a later bit's rule
   // may meet it among the node's pending operations and rewrite or cancel it.
-  auto op = std::make_shared<OP>(node, FILE_INDEX_OP_NONE, "", Json::Value());
+  std::shared_ptr<OP> op = NewOp(node);
   const uint32_t bits = event->event;
   if (bits & kEventCreate) {
     if (event->is_dir) {
@@ -480,16 +502,18 @@ void OPTree::HandleReindex(const std::shared_ptr<OPNode>& node, const std::share
 }
 
 void OPTree::CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to) {
-  auto follow_up = std::make_shared<OP>(to, FILE_INDEX_OP_NONE, "", Json::Value());
-  bool attached = false;
+  std::shared_ptr<OP> follow_up;
   ForEachPending(*from, [&](const std::shared_ptr<OP>& e) {
     if (!IsCarriable(e->op)) return;
-    follow_up->op = e->op;
+    const FileIndexOP kind = e->op;
     e->op = FILE_INDEX_OP_NONE;
-    if (!attached) {
+    // Attaching may grow `from`'s own list (a rename onto itself), which
+    // leaves `e` dangling: it is not touched afterwards.
+    if (!follow_up) {
+      follow_up = NewOp(to);
       Attach(follow_up);
-      attached = true;
     }
+    follow_up->op = kind;
   });
 }
 

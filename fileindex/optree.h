@@ -22,6 +22,10 @@
 #include <string_view>
 #include <vector>
 
+namespace vellis {
+class Arena;
+}  // namespace vellis
+
 namespace vellis::fileindex {
 
 // Bits of a queue line's "event".
@@ -44,6 +48,13 @@ struct Event {
   // the wrong type. "is_dir" defaults to false, "path_old" to empty, "data"
   // to null.
   explicit Event(const std::string& event_raw);
+  // An event with every field at its default (event 0, empty path).
+  Event() = default;
+
+  // Replaces every field with those of `event_raw`, as the constructor
+  // would, reusing the strings' storage; throws what the constructor throws,
+  // and then leaves the fields unspecified.
+  void Assign(const std::string& event_raw);
 
   uint32_t event = 0;
   bool is_dir = false;
@@ -64,6 +75,7 @@ enum FileIndexOP {
 };
 
 struct OPNode;
+class ChildIndex;
 
 // One pending operation on a node.
 struct OP {
@@ -85,15 +97,19 @@ struct OP {
 // One path component and the operations pending on it.
 struct OPNode : public std::enable_shared_from_this<OPNode> {
   OPNode(std::shared_ptr<OPNode> parent, const std::string& name);
+  ~OPNode();
+  OPNode(const OPNode&) = delete;
+  OPNode& operator=(const OPNode&) = delete;
 
   // The full path: the names from the root down joined with "/" ("/a/b";
   // the root's own path is empty).
   std::string GetPath() const;
 
-  // The child of that name, created and appended to `children` when
-  // missing; children keep their creation order. A linear scan: the tree's
-  // own lookups go through OPTree::GetNodeByPath and its index, which also
-  // finds children made here.
+  // The first child of that name, created and appended to `children` when
+  // missing; children keep their creation order. A folder with more than a
+  // few children keeps an index of them by name, so this is not a linear
+  // scan; children appended to `children` directly are indexed at the next
+  // lookup.
   std::shared_ptr<OPNode> GetChild(const std::string& name);
 
   // Calls fn for each operation in `ops`, in order, cancelled ones included.
@@ -106,10 +122,10 @@ struct OPNode : public std::enable_shared_from_this<OPNode> {
 
  private:
   friend class OPTree;
-  // Kept by the tree's index; two 32-bit fields keep a node in the same
-  // allocation size class.
-  uint32_t path_hash_ = 0;         // hash of GetPath()
-  uint32_t indexed_children_ = 0;  // leading entries of `children` in the index
+  // The first child named `name`, or null.
+  OPNode* FindChild(std::string_view name);
+  // Made once the folder has more than a few children.
+  std::unique_ptr<ChildIndex> child_index_;
 };
 
 class OPTree {
@@ -161,9 +177,10 @@ class OPTree {
  private:
   // Unlinks and frees every node and operation of the tree.
   void Clear();
-  // Puts children appended with OPNode::GetChild (and all below them) into
-  // the index; true when there were any.
-  bool IndexNewChildren(OPNode* node);
+  // The child of `node` named `name`, created when missing.
+  OPNode* ChildOf(OPNode* node, std::string_view name);
+  // A new operation of kind none on `node`, allocated in the arena.
+  std::shared_ptr<OP> NewOp(const std::shared_ptr<OPNode>& node);
   void Attach(const std::shared_ptr<OP>& op);
   void HandleCreate(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
   void HandleModify(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
@@ -175,22 +192,13 @@ class OPTree {
   // Moves pending upsert/attr/reindex work of `from` onto `to`.
   void CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to);
 
-  // Open-addressing index of every node below the root by its full path, so
-  // that most events cost one probe however deep or wide the tree is. A slot
-  // holds a node pointer tagged in its top 16 bits with bits of the path's
-  // hash, so a probe rarely touches a node that does not match.
-  class PathIndex {
-   public:
-    static uint32_t Hash(std::string_view path);
-    OPNode* Find(std::string_view path, uint32_t hash) const;
-    void Insert(OPNode* node, uint32_t hash);
-
-   private:
-    static uintptr_t Tag(uint32_t hash);
-    std::vector<uintptr_t> slots_;
-    size_t used_ = 0;
-  };
-  PathIndex index_;
+  // Nodes and operations made by the tree live here; see Clear.
+  Arena* arena_;
+  std::shared_ptr<OP> spare_op_;  // the last operation made; see NewOp
+  // The folder of the last path looked up: events come in bursts in one
+  // folder, and this spares the walk down to it.
+  OPNode* last_dir_ = nullptr;
+  std::string last_dir_path_;
 };
 
 // "[05] /old -> /new", "[04] /a, data={...}", "[02] /a".

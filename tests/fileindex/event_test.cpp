@@ -27,6 +27,39 @@ TEST(EventTest, ReadsEveryKeyAndDefaultsTheOptionalOnes) {
   EXPECT_EQ(JsonToString(full.data), R"({"audio":true})");
 }
 
+// The tree reads a whole queue through one reused event: each line must
+// leave exactly its own fields, whatever the line before it held.
+TEST(EventTest, AssignOverAnEarlierLineKeepsNothingOfIt) {
+  struct Case {
+    std::string line;
+    uint32_t event;
+    bool is_dir;
+    std::string path, path_old, data;
+  } cases[] = {
+      {R"({"event":131328,"is_dir":true,"path":"/s/new","path_old":"/s/old","data":{"audio":true}})",
+       0x20100u, true, "/s/new", "/s/old", R"({"audio":true})"},
+      {R"({"event":2,"path":"/s/a"})", 2u, false, "/s/a", "", "null"},
+      {R"({"event":256,"path":"/s/b","path_old":"/s/a/very/long/old/path/beyond/short/strings"})",
+       256u, false, "/s/b", "/s/a/very/long/old/path/beyond/short/strings", "null"},
+      // Members in any order; numbers and null convert as the JSON helpers
+      // convert them (1 is true, null is the empty string).
+      {R"({"path_old":null,"path":"/s/c","is_dir":1,"event":64})", 64u, true, "/s/c", "", "null"},
+      {R"({"data":[1],"event":4,"is_dir":"yes","path":"/s/d","path_old":5})", 4u, false, "/s/d",
+       "5", "[1]"},
+  };
+  Event e;
+  for (int pass = 0; pass < 2; ++pass) {  // the second pass follows the last case
+    for (const auto& c : cases) {
+      e.Assign(c.line);
+      EXPECT_EQ(e.event, c.event) << c.line;
+      EXPECT_EQ(e.is_dir, c.is_dir) << c.line;
+      EXPECT_EQ(e.path, c.path) << c.line;
+      EXPECT_EQ(e.path_old, c.path_old) << c.line;
+      EXPECT_EQ(JsonToString(e.data), c.data) << c.line;
+    }
+  }
+}
+
 TEST(EventTest, RefusesLinesThatAreNotAQueueEvent) {
   testing::FakePlatform platform;
   testing::ScopedPlatform scoped(&platform);

@@ -266,6 +266,57 @@ TEST_F(OPTreeTest, ChildMadeWithGetChildIsTheNodeOfItsPath) {
   EXPECT_EQ(b->children.size(), 2u);
 }
 
+// A wide folder is searched through an index of its children: children
+// made by the tree, by GetChild or appended to `children` directly are all
+// found, once each, in creation order, while lookups hop between folders.
+TEST_F(OPTreeTest, WideFolderFindsEveryChildWhicheverWayItWasMade) {
+  OPTree tree(WriteQueue({}));
+  std::shared_ptr<OPNode> wide = tree.GetNodeByPath("/v/wide");
+  std::vector<std::shared_ptr<OPNode>> made;
+  for (int i = 0; i < 300; ++i) {
+    const std::string name = "f" + std::to_string(i);
+    if (i % 3 == 0) {
+      made.push_back(wide->GetChild(name));
+    } else if (i % 3 == 1) {
+      made.push_back(tree.GetNodeByPath("/v/wide/" + name));
+    } else {
+      wide->children.push_back(std::make_shared<OPNode>(wide, name));
+      made.push_back(wide->children.back());
+    }
+    tree.GetNodeByPath("/v/other/g" + std::to_string(i % 7));  // another folder in between
+  }
+  for (int i = 299; i >= 0; --i) {
+    const std::string name = "f" + std::to_string(i);
+    EXPECT_EQ(tree.GetNodeByPath("/v/wide/" + name), made[i]) << name;
+    EXPECT_EQ(wide->GetChild(name), made[i]) << name;
+    EXPECT_EQ(tree.GetNodeByPath("/v/wide/" + name + "/x")->parent, made[i]) << name;
+  }
+  ASSERT_EQ(wide->children.size(), 300u);
+  for (int i = 0; i < 300; ++i) EXPECT_EQ(wide->children[i], made[i]);
+  // A name appended twice resolves to its first node, as a scan would.
+  wide->children.push_back(std::make_shared<OPNode>(wide, "f7"));
+  EXPECT_EQ(tree.GetNodeByPath("/v/wide/f7"), made[7]);
+}
+
+// The tree's nodes and operations live in memory the tree allocates in
+// bulk: operations a caller kept still print their paths after the tree is
+// gone.
+TEST_F(OPTreeTest, DeliveredOperationsOutliveTheTree) {
+  std::vector<std::shared_ptr<OP>> kept;
+  {
+    OPTree tree(WriteQueue({R"({"event":64,"path":"/v/s/a/new.txt"})",
+                            R"({"event":256,"path":"/v/s/b","path_old":"/v/s/a"})",
+                            R"({"event":131072,"path":"/v/s","data":{"audio":true}})"}));
+    tree.ProcessOP([&](std::shared_ptr<OP> op) { kept.push_back(op); });
+  }
+  std::vector<std::string> printed;
+  for (const auto& op : kept) printed.push_back(Print(op));
+  EXPECT_EQ(printed, (std::vector<std::string>{
+                         "[05] /v/s/a -> /v/s/b", "[02] /v/s/b/new.txt",
+                         R"([04] /v/s, data={"audio":true})"}))
+      << Join(printed);
+}
+
 TEST_F(OPTreeTest, ReindexOfAShallowFolderCancelsWorkOnAVeryDeepPath) {
   std::string deep = "/s";
   while (deep.size() + 2 <= OPTree::kMaxPathBytes) deep += "/d";
