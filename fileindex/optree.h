@@ -192,11 +192,14 @@ class OPTree {
   // Moves pending upsert/attr/reindex work of `from` onto `to`.
   void CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to);
 
-  // Nodes and operations made by the tree live here; see Clear.
+  // Nodes and operations made by the tree are allocated here. The tree holds
+  // one reference and each object another, so the memory goes when the tree
+  // and the last operation a caller kept are gone.
   Arena* arena_;
   std::shared_ptr<OP> spare_op_;  // the last operation made; see NewOp
   // The folder of the last path looked up: events come in bursts in one
-  // folder, and this spares the walk down to it.
+  // folder, and this spares the walk down to it. Nodes are not removed
+  // before Clear, which forgets it.
   OPNode* last_dir_ = nullptr;
   std::string last_dir_path_;
 };
