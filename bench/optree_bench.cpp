@@ -5,9 +5,8 @@
 // events of what users do on a share), a scattered one (the same size, each
 // line drawn on its own: the worst case for the tree) and a wide one
 // (100,000 new files in one folder) against the same number spread over
-// 1,000 folders. After the runs it
-// prints folding as a ratio to parsing and to reading, the wide/spread
-// ratio, and the heap held per tree node.
+// 1,000 folders. After the runs it prints folding as a ratio to parsing and
+// to reading, the wide/spread ratio, and the heap held per tree node.
 //
 //   build/bench/optree_bench [--benchmark_filter=...]
 #include <benchmark/benchmark.h>
