@@ -2,14 +2,14 @@
 
 #include <dirent.h>
 #include <errno.h>
+#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>
-
-#include <gtest/gtest.h>
 
 #include <string>
 #include <vector>
 
+#include "tests/support/parse_json.h"
 #include "tests/support/temp_root.h"
 
 namespace vellis {
@@ -19,11 +19,7 @@ using testing::ReadFile;
 using testing::TempRoot;
 using testing::WriteFile;
 
-Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
-}
+using testing::ParseJson;
 
 std::string Nested(int depth) { return std::string(depth, '[') + std::string(depth, ']'); }
 
@@ -32,7 +28,7 @@ template <typename T>
 std::string GetReason(const std::string& obj, const std::string& key, bool required) {
   T out{};
   try {
-    GetJsonValue(out, Parse(obj), key, required);
+    GetJsonValue(out, ParseJson(obj), key, required);
   } catch (const Error& e) {
     EXPECT_EQ(e.GetCode(), kErrBadArgument) << obj;
     return e.what();
@@ -48,8 +44,7 @@ TEST(GetJsonValueTest, RefusesWithReasonAndData) {
       {GetReason<int>(R"({"a":"x"})", "a", true), R"(Not a string, data={"a":"x"})"},
       {GetReason<std::string>(R"({"a":[1]})", "a", true), R"(Not a string, data={"a":[1]})"},
       {GetReason<unsigned int>(R"({"a":-1})", "a", true), R"(Not a string, data={"a":-1})"},
-      {GetReason<int>(R"({"a":4294967296})", "a", true),
-       R"(Not a string, data={"a":4294967296})"},
+      {GetReason<int>(R"({"a":4294967296})", "a", true), R"(Not a string, data={"a":4294967296})"},
       {GetReason<bool>(R"({"a":1})", "b", true), R"(Missing property: b, data={"a":1})"},
       {GetReason<Json::Value>(R"({"a":1})", "b", true), R"(Missing property: b, data={"a":1})"},
       {GetReason<std::string>("[1]", "a", true), "Not an object, data=[1]"},
@@ -60,7 +55,7 @@ TEST(GetJsonValueTest, RefusesWithReasonAndData) {
 }
 
 TEST(GetJsonValueTest, OptionalMissingOrUnconvertibleLeavesOutUntouched) {
-  const Json::Value obj = Parse(R"({"s":"x","arr":[1],"neg":-5,"obj":{}})");
+  const Json::Value obj = ParseJson(R"({"s":"x","arr":[1],"neg":-5,"obj":{}})");
   for (const char* key : {"missing", "s", "arr", "obj"}) {
     int i = 42;
     GetJsonValue(i, obj, key, false);
@@ -78,7 +73,7 @@ TEST(GetJsonValueTest, OptionalMissingOrUnconvertibleLeavesOutUntouched) {
 }
 
 TEST(GetJsonValueTest, NullMemberYieldsTheEmptyValueForEveryType) {
-  const Json::Value obj = Parse(R"({"n":null})");
+  const Json::Value obj = ParseJson(R"({"n":null})");
   std::string s = "x";
   bool b = true;
   int i = 1;
@@ -101,7 +96,7 @@ TEST(GetJsonValueTest, NullMemberYieldsTheEmptyValueForEveryType) {
 // asString/asBool/...); the helpers must not make them stricter.
 TEST(GetJsonValueTest, FollowsTheJsonLibraryConversions) {
   const Json::Value obj =
-      Parse(R"({"t":true,"one":1,"real":2.0,"big":3000000000,"huge":9007199254740993})");
+      ParseJson(R"({"t":true,"one":1,"real":2.0,"big":3000000000,"huge":9007199254740993})");
   struct Case {
     std::string key;
     std::string as_string;
@@ -128,11 +123,11 @@ TEST(JsonArrTest, ConvertsStringVectorsBothWays) {
   const std::vector<std::string> vec = {"a", "", "\xc3\xa9"};
   EXPECT_EQ(JsonToString(Vec2JsonArr(vec)), "[\"a\",\"\",\"\xc3\xa9\"]");
   EXPECT_EQ(JsonArr2Vec<std::string>(Vec2JsonArr(vec)), vec);
-  EXPECT_EQ(JsonArr2Vec<std::string>(Parse(R"([1,true,null])")),
+  EXPECT_EQ(JsonArr2Vec<std::string>(ParseJson(R"([1,true,null])")),
             (std::vector<std::string>{"1", "true", ""}));
-  EXPECT_TRUE(JsonArr2Vec<std::string>(Parse(R"({"a":"b"})")).empty());
+  EXPECT_TRUE(JsonArr2Vec<std::string>(ParseJson(R"({"a":"b"})")).empty());
   try {
-    JsonArr2Vec<std::string>(Parse(R"(["a",{}])"));
+    JsonArr2Vec<std::string>(ParseJson(R"(["a",{}])"));
     ADD_FAILURE() << "an object element was accepted";
   } catch (const Error& e) {
     EXPECT_EQ(e.GetCode(), kErrBadArgument);
@@ -154,8 +149,8 @@ TEST(JsonApplyChangesTest, MergesObjectsRemovesNullsReplacesTheRest) {
       {R"({"a":1})", R"([1])", R"({"a":1})"},
   };
   for (const auto& c : cases) {
-    Json::Value target = Parse(c.target);
-    JsonApplyChanges(target, Parse(c.changes));
+    Json::Value target = ParseJson(c.target);
+    JsonApplyChanges(target, ParseJson(c.changes));
     EXPECT_EQ(JsonToString(target), c.expected) << c.target << " + " << c.changes;
   }
 }
@@ -197,11 +192,12 @@ TEST(JsonFromStringTest, AcceptsUtf8AndDeepButBoundedNesting) {
 }
 
 TEST(JsonToStringTest, OneLineKeyOrderUtf8Kept) {
-  const Json::Value v = Parse("{\"b\":[true,null],\"a\":\"\xc3\xa9\\n\\u0001\",\"c\":{\"z\":1,\"y\":2}}");
+  const Json::Value v =
+      ParseJson("{\"b\":[true,null],\"a\":\"\xc3\xa9\\n\\u0001\",\"c\":{\"z\":1,\"y\":2}}");
   const std::string text = JsonToString(v);
   EXPECT_EQ(text, "{\"a\":\"\xc3\xa9\\n\\u0001\",\"b\":[true,null],\"c\":{\"y\":2,\"z\":1}}");
   EXPECT_EQ(text.find('\n'), std::string::npos);
-  EXPECT_EQ(Parse(text), v);
+  EXPECT_EQ(ParseJson(text), v);
 }
 
 class JsonFileTest : public ::testing::Test {
@@ -223,7 +219,7 @@ class JsonFileTest : public ::testing::Test {
   TempRoot root_;
   std::string dir_ = root_.Path("/etc");
   std::string path_ = dir_ + "/status.json";
-  Json::Value value_ = Parse("{\"name\":\"\xc3\xa9t\xc3\xa9\",\"list\":[1,2],\"n\":null}");
+  Json::Value value_ = ParseJson("{\"name\":\"\xc3\xa9t\xc3\xa9\",\"list\":[1,2],\"n\":null}");
 };
 
 TEST_F(JsonFileTest, WritesAtomicallyReadableMode0644) {

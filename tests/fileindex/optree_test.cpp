@@ -9,6 +9,7 @@
 #include "common/error.h"
 #include "common/json_util.h"
 #include "tests/support/fake_platform.h"
+#include "tests/support/parse_json.h"
 #include "tests/support/temp_root.h"
 
 namespace vellis::fileindex {
@@ -26,11 +27,7 @@ std::string Join(const std::vector<std::string>& v) {
   return s;
 }
 
-Json::Value ParseJson(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
-}
+using testing::ParseJson;
 
 class OPTreeTest : public ::testing::Test {
  protected:
@@ -87,23 +84,34 @@ TEST_F(OPTreeTest, FoldsLinesOfOnePathByTheMergeRules) {
        {modify, cfg_doc},
        {R"([04] /s/a, data={"document":true})"},
        1},
-      {"update cfg then delete: both stand", {cfg_doc, del},
-       {R"([04] /s/a, data={"document":true})", "[01] /s/a"}, 2},
+      {"update cfg then delete: both stand",
+       {cfg_doc, del},
+       {R"([04] /s/a, data={"document":true})", "[01] /s/a"},
+       2},
       {"reindex then delete: both stand", {reindex, del}, {"[06] /s/a", "[01] /s/a"}, 2},
       {"modify then reindex", {modify, reindex}, {"[06] /s/a"}, 1},
       {"delete then update cfg: dropped", {del, cfg_doc}, {"[01] /s/a"}, 1},
       {"create and modify on one line yield nothing",
-       {R"({"event":66,"path":"/s/a","is_dir":false})"}, {}, 1},
+       {R"({"event":66,"path":"/s/a","is_dir":false})"},
+       {},
+       1},
       {"attr and modify on one line yield nothing", {R"({"event":6,"path":"/s/a"})"}, {}, 1},
-      {"a deleted directory is reindexed", {R"({"event":128,"path":"/s/d","is_dir":true})"},
-       {"[06] /s/d"}, 1},
-      {"a created directory is reindexed", {R"({"event":64,"path":"/s/d","is_dir":true})"},
-       {"[06] /s/d"}, 1},
+      {"a deleted directory is reindexed",
+       {R"({"event":128,"path":"/s/d","is_dir":true})"},
+       {"[06] /s/d"},
+       1},
+      {"a created directory is reindexed",
+       {R"({"event":64,"path":"/s/d","is_dir":true})"},
+       {"[06] /s/d"},
+       1},
       {"rename then modify of the new path",
        {R"({"event":256,"path":"/s/b","path_old":"/s/a"})", R"({"event":2,"path":"/s/b"})"},
-       {"[05] /s/a -> /s/b", "[02] /s/b"}, 2},
+       {"[05] /s/a -> /s/b", "[02] /s/b"},
+       2},
       {"no bit, or only unknown bits: no operation",
-       {R"({"event":0,"path":"/s/a"})", R"({"event":9,"path":"/s/a"})"}, {}, 0},
+       {R"({"event":0,"path":"/s/a"})", R"({"event":9,"path":"/s/a"})"},
+       {},
+       0},
   };
   for (const auto& c : cases) {
     Folded f = Fold(c.lines);
@@ -121,8 +129,8 @@ TEST_F(OPTreeTest, CreatedDirectoryCancelsPendingWorkBelowButNotRenames) {
       R"({"event":2,"path":"/s/other"})",
       R"({"event":64,"path":"/s/d","is_dir":true})",
   });
-  EXPECT_EQ(f.delivered, (std::vector<std::string>{"[05] /s/x -> /s/d/y", "[02] /s/other",
-                                                   "[06] /s/d"}))
+  EXPECT_EQ(f.delivered,
+            (std::vector<std::string>{"[05] /s/x -> /s/d/y", "[02] /s/other", "[06] /s/d"}))
       << Join(f.delivered);
   EXPECT_EQ(f.count, 6u);
 }
@@ -311,17 +319,15 @@ TEST_F(OPTreeTest, DeliveredOperationsOutliveTheTree) {
   }
   std::vector<std::string> printed;
   for (const auto& op : kept) printed.push_back(Print(op));
-  EXPECT_EQ(printed, (std::vector<std::string>{
-                         "[05] /v/s/a -> /v/s/b", "[02] /v/s/b/new.txt",
-                         R"([04] /v/s, data={"audio":true})"}))
+  EXPECT_EQ(printed, (std::vector<std::string>{"[05] /v/s/a -> /v/s/b", "[02] /v/s/b/new.txt",
+                                               R"([04] /v/s, data={"audio":true})"}))
       << Join(printed);
 }
 
 TEST_F(OPTreeTest, ReindexOfAShallowFolderCancelsWorkOnAVeryDeepPath) {
   std::string deep = "/s";
   while (deep.size() + 2 <= OPTree::kMaxPathBytes) deep += "/d";
-  Folded f = Fold({R"({"event":2,"path":")" + deep + R"("})",
-                   R"({"event":65536,"path":"/s"})"});
+  Folded f = Fold({R"({"event":2,"path":")" + deep + R"("})", R"({"event":65536,"path":"/s"})"});
   EXPECT_EQ(f.delivered, (std::vector<std::string>{"[06] /s"}));
   EXPECT_EQ(f.count, 2u);
 }
@@ -335,8 +341,8 @@ TEST_F(OPTreeTest, PrintsOperationsAndNodes) {
   } cases[] = {
       {std::make_shared<OP>(node("/volume1/share/a.txt"), FILE_INDEX_OP_UPSERT, "", Json::Value()),
        "[02] /volume1/share/a.txt"},
-      {std::make_shared<OP>(node("/volume1/share/new"), FILE_INDEX_OP_RENAME,
-                            "/volume1/share/old", Json::Value()),
+      {std::make_shared<OP>(node("/volume1/share/new"), FILE_INDEX_OP_RENAME, "/volume1/share/old",
+                            Json::Value()),
        "[05] /volume1/share/old -> /volume1/share/new"},
       {std::make_shared<OP>(node("/volume1/share/d"), FILE_INDEX_OP_REINDEX, "", Json::Value()),
        "[06] /volume1/share/d"},

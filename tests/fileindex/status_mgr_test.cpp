@@ -13,6 +13,7 @@
 #include "fileindex/elastic/communication.h"
 #include "tests/support/fake_index_daemon.h"
 #include "tests/support/fake_share_platform.h"
+#include "tests/support/parse_json.h"
 #include "tests/support/temp_root.h"
 #include "tests/support/thrown.h"
 
@@ -24,19 +25,14 @@ using testing::Thrown;
 using testing::ReadFile;
 using testing::WriteFile;
 
-Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
-}
+using testing::ParseJson;
 
 class StatusMgrTest : public ::testing::Test {
  protected:
   StatusMgrTest() { platform_.SetTime(1700000000); }
 
   std::string StatusPath() const { return RootPath(kFileIndexStatusCfgPath); }
-  Json::Value StatusFile() const { return Parse(ReadFile(StatusPath())); }
-
+  Json::Value StatusFile() const { return ParseJson(ReadFile(StatusPath())); }
 
   testing::TempRoot root_;
   testing::FakeSharePlatform platform_;
@@ -68,8 +64,8 @@ TEST_F(StatusMgrTest, PauseAndResumeAreSavedAndAnnounced) {
 
   auto commands = daemon_.Commands();
   ASSERT_EQ(commands.size(), 3u);
-  EXPECT_EQ(commands[0], Parse(R"({"type":"pause","data":{"resume_time":1700007200}})"));
-  EXPECT_EQ(commands[2], Parse(R"({"type":"resume","data":null})"));
+  EXPECT_EQ(commands[0], ParseJson(R"({"type":"pause","data":{"resume_time":1700007200}})"));
+  EXPECT_EQ(commands[2], ParseJson(R"({"type":"resume","data":null})"));
   EXPECT_EQ(platform_.Resets(), (std::vector<std::string>{"root", "root", "root"}))
       << "each save runs as root";
 }

@@ -37,10 +37,4 @@ std::shared_ptr<fileindex::Folder> MakeFolder(const std::string& path, const std
                                              false);
 }
 
-Json::Value ParseJson(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
-}
-
 }  // namespace vellis::testing

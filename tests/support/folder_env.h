@@ -12,6 +12,7 @@
 
 #include "fileindex/folder.h"
 #include "tests/support/fake_share_platform.h"
+#include "tests/support/parse_json.h"
 #include "tests/support/temp_root.h"
 #include "tests/support/thrown.h"
 
@@ -64,8 +65,5 @@ std::shared_ptr<fileindex::Folder> MakeFolder(const std::string& path,
                                               const std::string& name = "n", bool document = true,
                                               bool audio = true, bool video = true,
                                               bool photo = true);
-
-// `text` parsed; a failure to parse fails the calling test.
-Json::Value ParseJson(const std::string& text);
 
 }  // namespace vellis::testing

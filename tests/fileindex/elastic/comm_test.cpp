@@ -8,6 +8,7 @@
 #include "common/root_path.h"
 #include "sdk/frame.h"
 #include "tests/support/fake_search_daemon.h"
+#include "tests/support/parse_json.h"
 #include "tests/support/scripted_platform.h"
 #include "tests/support/temp_root.h"
 
@@ -16,11 +17,7 @@ namespace {
 
 using testing::FakeSearchDaemon;
 
-Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
-}
+using testing::ParseJson;
 
 class SendRequestImplTest : public ::testing::Test {
  protected:
@@ -39,7 +36,7 @@ class SendRequestImplTest : public ::testing::Test {
   testing::ScopedPlatform scoped_{&platform_};
   std::unique_ptr<FakeSearchDaemon> daemon_;
   RequestTimeouts old_timeouts_{};
-  Json::Value req_ = Parse(R"({"command":"commit","data":{"id":"fileindex_music"}})");
+  Json::Value req_ = ParseJson(R"({"command":"commit","data":{"id":"fileindex_music"}})");
 };
 
 TEST_F(SendRequestImplTest, WaitsForASocketThatAppearsAfterThreeSeconds) {
@@ -48,7 +45,7 @@ TEST_F(SendRequestImplTest, WaitsForASocketThatAppearsAfterThreeSeconds) {
   });
   Json::Value res;
   SendRequestImpl(res, req_);
-  EXPECT_EQ(res, Parse(R"({"success":true})"));
+  EXPECT_EQ(res, ParseJson(R"({"success":true})"));
   EXPECT_EQ(platform_.Sleeps(), (std::vector<unsigned>{1, 1, 1}));
   auto waits = platform_.LogsContaining("elastic socket is not ready, retry ... ");
   ASSERT_EQ(waits.size(), 3u);
@@ -83,7 +80,7 @@ TEST_F(SendRequestImplTest, ReturnsTheWholeAnswer) {
     StartDaemon().Push(FakeSearchDaemon::Raw(answer));
     Json::Value res;
     SendRequestImpl(res, req_);
-    EXPECT_EQ(res, Parse(answer)) << answer;
+    EXPECT_EQ(res, ParseJson(answer)) << answer;
   }
   EXPECT_TRUE(platform_.Sleeps().empty());
 }
@@ -132,7 +129,7 @@ TEST_F(SendRequestImplTest, RefusesBadAnswersWithAClearError) {
 }
 
 TEST_F(SendRequestImplTest, CompoundAnswerThrowsOnBusySubRequestAfterLoggingOthers) {
-  Json::Value req = Parse(R"({"compound":[
+  Json::Value req = ParseJson(R"({"compound":[
       {"command":"document_set_by_id","data":{"id":"fileindex_s","doc_id":"/v/s/a"}},
       {"command":"document_set_by_id","data":{"id":"fileindex_s","doc_id":"/v/s/b"}},
       {"command":"document_set_by_id","data":{"id":"fileindex_s","doc_id":"/v/s/c"}}]})");
@@ -157,7 +154,8 @@ TEST_F(SendRequestImplTest, CompoundAnswerThrowsOnBusySubRequestAfterLoggingOthe
 }
 
 TEST_F(SendRequestImplTest, CompoundAnswerWithOtherFailuresSucceeds) {
-  Json::Value req = Parse(R"({"compound":[{"command":"a","data":{}},{"command":"b","data":{}}]})");
+  Json::Value req =
+      ParseJson(R"({"compound":[{"command":"a","data":{}},{"command":"b","data":{}}]})");
   const std::string failed = R"([{"success":false,"error":{"code":5,"msg":"x"}},
                                 {"success":false,"error":{"code":6,"msg":"y"}}])";
   struct Case {
@@ -175,13 +173,13 @@ TEST_F(SendRequestImplTest, CompoundAnswerWithOtherFailuresSucceeds) {
     StartDaemon().Push(FakeSearchDaemon::Raw(c.answer));
     Json::Value res;
     EXPECT_NO_THROW(SendRequestImpl(res, c.request)) << c.answer;
-    EXPECT_EQ(res, Parse(c.answer));
+    EXPECT_EQ(res, ParseJson(c.answer));
     EXPECT_EQ(platform_.LogsContaining("Compound failed").size(), c.logged) << c.answer;
   }
 }
 
 TEST_F(SendRequestImplTest, CompoundAnswerWithoutDataArrayIsRefused) {
-  Json::Value req = Parse(R"({"compound":[]})");
+  Json::Value req = ParseJson(R"({"compound":[]})");
   StartDaemon().Push(FakeSearchDaemon::Raw(R"({"success":true,"has_fail":true,"data":{}})"));
   Json::Value res;
   try {

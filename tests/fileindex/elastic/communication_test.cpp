@@ -10,6 +10,7 @@
 #include "common/root_path.h"
 #include "sdk/frame.h"
 #include "tests/support/fake_index_daemon.h"
+#include "tests/support/parse_json.h"
 #include "tests/support/scripted_platform.h"
 #include "tests/support/temp_root.h"
 
@@ -18,11 +19,7 @@ namespace {
 
 using testing::FakeIndexDaemon;
 
-Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
-}
+using testing::ParseJson;
 
 std::string Frame(const std::string& text) {
   return sdk::EncodeFrameHeader(static_cast<uint32_t>(text.size())) + text;
@@ -58,16 +55,16 @@ class SendCommandTest : public ::testing::Test {
 
 TEST_F(SendCommandTest, DeliversCommandsAndReturnsTheAnswer) {
   StartDaemon();
-  EXPECT_EQ(SendCommandToDaemon("pause", Parse(R"({"resume_time":1700007200})")),
+  EXPECT_EQ(SendCommandToDaemon("pause", ParseJson(R"({"resume_time":1700007200})")),
             R"({"success":true})");
   daemon_->SetAnswerBytes(Frame(R"({"success":false})"));
   EXPECT_EQ(SendCommandToDaemon("resume", Json::Value()), R"({"success":false})");
   SendCommandToDaemon("worker_create", Json::Value("music"));
   auto commands = daemon_->Commands();
   ASSERT_EQ(commands.size(), 3u);
-  EXPECT_EQ(commands[0], Parse(R"({"type":"pause","data":{"resume_time":1700007200}})"));
-  EXPECT_EQ(commands[1], Parse(R"({"type":"resume","data":null})"));
-  EXPECT_EQ(commands[2], Parse(R"({"type":"worker_create","data":"music"})"));
+  EXPECT_EQ(commands[0], ParseJson(R"({"type":"pause","data":{"resume_time":1700007200}})"));
+  EXPECT_EQ(commands[1], ParseJson(R"({"type":"resume","data":null})"));
+  EXPECT_EQ(commands[2], ParseJson(R"({"type":"worker_create","data":"music"})"));
   EXPECT_TRUE(platform_.Sleeps().empty());
 }
 

@@ -11,6 +11,7 @@
 #include "fileindex/elastic/comm.h"
 #include "tests/support/fake_document_store.h"
 #include "tests/support/fake_search_daemon.h"
+#include "tests/support/parse_json.h"
 #include "tests/support/scripted_platform.h"
 #include "tests/support/temp_root.h"
 
@@ -19,11 +20,7 @@ namespace {
 
 using testing::FakeSearchDaemon;
 
-Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  EXPECT_TRUE(JsonFromString(v, text)) << text;
-  return v;
-}
+using testing::ParseJson;
 
 class ElasticControlTest : public ::testing::Test {
  protected:
@@ -52,8 +49,8 @@ TEST_F(ElasticControlTest, BusyDaemonIsWaitedOutAndNotifiedOnceAfterEleventhAnsw
   platform_.SetRandValues({0, 1, 2, 3, 4, 7});
   daemon_.Push(FakeSearchDaemon::Busy(1401), 11);
   Json::Value res;
-  SendRequestRetryOnBusy(res, Parse(R"({"command":"commit","data":{"id":"fileindex_music"}})"));
-  EXPECT_EQ(res, Parse(R"({"success":true})"));
+  SendRequestRetryOnBusy(res, ParseJson(R"({"command":"commit","data":{"id":"fileindex_music"}})"));
+  EXPECT_EQ(res, ParseJson(R"({"success":true})"));
   EXPECT_EQ(daemon_.Requests().size(), 12u);
   EXPECT_EQ(MemoryNotifications(), 1);
   std::vector<unsigned> expected_sleeps = {900, 960, 1020, 1080, 1140};
@@ -77,7 +74,7 @@ TEST_F(ElasticControlTest, NotificationCountsDependOnlyOnBusyAnswers) {
   int before = 0;
   for (const auto& c : cases) {
     daemon_.Push(FakeSearchDaemon::Busy(1400), c.busy);
-    SendRequestDiscardResult(Parse(R"({"command":"commit","data":{"id":"fileindex_s"}})"));
+    SendRequestDiscardResult(ParseJson(R"({"command":"commit","data":{"id":"fileindex_s"}})"));
     EXPECT_EQ(MemoryNotifications() - before, c.notifications) << c.busy << " busy answers";
     before = MemoryNotifications();
   }
@@ -87,7 +84,8 @@ TEST_F(ElasticControlTest, OtherErrorsEndTheRetryLoop) {
   daemon_.Push(FakeSearchDaemon::Busy(1400), 2);
   daemon_.Push(FakeSearchDaemon::Failure(7, "no such index"));
   try {
-    SendRequestDiscardResult(Parse(R"({"command":"index_delete","data":{"id":"fileindex_s"}})"));
+    SendRequestDiscardResult(
+        ParseJson(R"({"command":"index_delete","data":{"id":"fileindex_s"}})"));
     FAIL() << "error swallowed";
   } catch (const Error& e) {
     EXPECT_EQ(e.GetCode(), 7);
@@ -98,7 +96,7 @@ TEST_F(ElasticControlTest, OtherErrorsEndTheRetryLoop) {
 }
 
 TEST_F(ElasticControlTest, CompoundWithBusySubRequestIsRetriedWholeAndLoggedSafely) {
-  Json::Value req = Parse(R"({"compound":[
+  Json::Value req = ParseJson(R"({"compound":[
       {"command":"document_set_by_id","data":{"id":"fileindex_s","doc_id":"/v/s/a"}},
       {"command":"document_set_by_id","data":{"id":"fileindex_s","doc_id":"/v/s/b"}}]})");
   daemon_.Push(FakeSearchDaemon::Raw(R"({"success":true,"has_fail":true,"data":[
@@ -114,7 +112,7 @@ TEST_F(ElasticControlTest, CompoundWithBusySubRequestIsRetriedWholeAndLoggedSafe
       << retries[0];
 
   daemon_.Push(FakeSearchDaemon::Busy(1400));
-  SendRequestDiscardResult(Parse(R"({"compound":[]})"));
+  SendRequestDiscardResult(ParseJson(R"({"compound":[]})"));
   EXPECT_NE(platform_.LogsContaining("Command: compound[0], db: ").size(), 0u);
 }
 
@@ -140,7 +138,7 @@ TEST_F(ElasticControlTest, IndexLifecycleRequests) {
     size_t before = daemon_.Requests().size();
     c.call();
     ASSERT_EQ(daemon_.Requests().size(), before + 1) << c.request;
-    EXPECT_EQ(daemon_.Requests().back(), Parse(c.request));
+    EXPECT_EQ(daemon_.Requests().back(), ParseJson(c.request));
   }
 }
 
@@ -156,8 +154,8 @@ TEST_F(ElasticControlTest, UpsertAndAttrSendTheExtractedDocument) {
   IndexUpsert("s", "/v/s/a.txt", true);
   IndexUpsert("s", "/v/s/a.txt", false);
   IndexAttr("s", "/v/s/a.txt");
-  const Json::Value doc =
-      Parse(R"({"QORUMDPath":"/v/s/a.txt","QORUMDFSName":"a.txt","QORUMDSearchFileName":"a.txt"})");
+  const Json::Value doc = ParseJson(
+      R"({"QORUMDPath":"/v/s/a.txt","QORUMDFSName":"a.txt","QORUMDSearchFileName":"a.txt"})");
   auto sent = daemon_.Requests();
   ASSERT_EQ(sent.size(), 3u);
   const char* commands[] = {"document_upsert_by_id", "document_upsert_by_id", "document_set_by_id"};
@@ -168,7 +166,7 @@ TEST_F(ElasticControlTest, UpsertAndAttrSendTheExtractedDocument) {
     EXPECT_EQ(sent[i]["data"]["doc_id"], "/v/s/a.txt") << i;
     EXPECT_EQ(sent[i]["data"]["data"], doc) << i;
     EXPECT_EQ(options_seen[i],
-              Parse(need_meta[i] ? R"({"need_meta":true})" : R"({"need_meta":false})"));
+              ParseJson(need_meta[i] ? R"({"need_meta":true})" : R"({"need_meta":false})"));
   }
 }
 
@@ -202,7 +200,7 @@ TEST_F(ElasticControlTest, DeleteRequestsTouchOnlyTheirOwnDocuments) {
   ServeStore();
   for (const char* p : {"/vol/share/a", "/vol/share/a/x", "/vol/share/a/y/z", "/vol/share/ab",
                         "/vol/share/ab/x", "/vol/share/b"}) {
-    store_.Put("fileindex_share", p, Parse(std::string(R"({"QORUMDPath":")") + p + "\"}"));
+    store_.Put("fileindex_share", p, ParseJson(std::string(R"({"QORUMDPath":")") + p + "\"}"));
   }
   IndexDelDir("share", "/vol/share/a");
   IndexDel("share", "/vol/share/b");
@@ -210,7 +208,7 @@ TEST_F(ElasticControlTest, DeleteRequestsTouchOnlyTheirOwnDocuments) {
   for (const auto& [id, doc] : store_.Docs("fileindex_share")) left.push_back(id);
   EXPECT_EQ(left, (std::vector<std::string>{"/vol/share/a", "/vol/share/ab", "/vol/share/ab/x"}));
   EXPECT_EQ(daemon_.Requests()[0]["data"]["query"],
-            Parse(R"({"qsl":{"prefix":{"QORUMDPath":"/vol/share/a/"}}})"));
+            ParseJson(R"({"qsl":{"prefix":{"QORUMDPath":"/vol/share/a/"}}})"));
 }
 
 TEST_F(ElasticControlTest, RenamingADirectoryRewritesEveryDocumentBelowIt) {
@@ -248,7 +246,7 @@ TEST_F(ElasticControlTest, RenamingADirectoryRewritesEveryDocumentBelowIt) {
 
 TEST_F(ElasticControlTest, RenamingAFileSendsAnEmptyCompoundAndSkipsStrayAnswers) {
   daemon_.Push(FakeSearchDaemon::Success());
-  daemon_.Push(FakeSearchDaemon::Success(Parse(R"([{"QORUMDPath":"/vol/share/f.txt2"}])")));
+  daemon_.Push(FakeSearchDaemon::Success(ParseJson(R"([{"QORUMDPath":"/vol/share/f.txt2"}])")));
   IndexRename("share", "/vol/share/g.txt", "/vol/share/f.txt");
   auto sent = daemon_.Requests();
   ASSERT_EQ(sent.size(), 3u);
@@ -256,18 +254,18 @@ TEST_F(ElasticControlTest, RenamingAFileSendsAnEmptyCompoundAndSkipsStrayAnswers
   EXPECT_EQ(sent[0]["data"]["doc_id"], "/vol/share/f.txt");
   EXPECT_EQ(sent[0]["data"]["data"]["QORUMDParent"], "/vol/share");
   EXPECT_EQ(sent[0]["data"]["data"]["QORUMDKind"], "txt");
-  EXPECT_EQ(sent[2], Parse(R"({"compound":[]})"));
+  EXPECT_EQ(sent[2], ParseJson(R"({"compound":[]})"));
   EXPECT_EQ(platform_.LogsContaining("Skip rename of a document not below /vol/share/f.txt").size(),
             1u);
 }
 
 TEST_F(ElasticControlTest, PrefixListingAppendsAndRefusesAnswersWithoutData) {
-  daemon_.Push(FakeSearchDaemon::Success(Parse(
+  daemon_.Push(FakeSearchDaemon::Success(ParseJson(
       R"([{"QORUMDPath":"/v/s/d/1"},{"other":1},{"QORUMDPath":7},{"QORUMDPath":"/v/s/d/2"}])")));
   std::vector<std::string> paths = {"kept"};
   IndexGetByPrefixPath("s", "/v/s/d", paths);
   EXPECT_EQ(paths, (std::vector<std::string>{"kept", "/v/s/d/1", "/v/s/d/2"}));
-  EXPECT_EQ(daemon_.Requests()[0]["data"]["load_field"], Parse(R"(["QORUMDPath"])"));
+  EXPECT_EQ(daemon_.Requests()[0]["data"]["load_field"], ParseJson(R"(["QORUMDPath"])"));
 
   for (const char* answer : {R"({"success":true})", R"({"success":true,"data":{}})"}) {
     daemon_.Push(FakeSearchDaemon::Raw(answer));
@@ -300,10 +298,10 @@ TEST_F(ElasticControlTest, TermSuggestionIsOneCompoundRequest) {
   UpdateTermSuggestion("db1", {});
   auto sent = daemon_.Requests();
   ASSERT_EQ(sent.size(), 2u);
-  EXPECT_EQ(sent[0], Parse(R"({"compound":[
+  EXPECT_EQ(sent[0], ParseJson(R"({"compound":[
       {"command":"update_term_suggestion","data":{"doc_id_field":"id1","db_name":"db1"}},
       {"command":"update_term_suggestion","data":{"doc_id_field":"id2","db_name":"db1"}}]})"));
-  EXPECT_EQ(sent[1], Parse(R"({"compound":[]})"));
+  EXPECT_EQ(sent[1], ParseJson(R"({"compound":[]})"));
 }
 
 }  // namespace
