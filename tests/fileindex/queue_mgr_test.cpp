@@ -44,6 +44,25 @@ class QueueMgrTest : public ::testing::Test {
   std::string queue_ = root_.Path("/share.queue");
   std::string side_ = queue_ + ".tmp";
   QueueMgr mgr_{queue_};
+
+  // A query over a live queue and a side file (each absent when empty).
+  struct QueryCase {
+    std::string live;
+    std::string side;
+    std::string query;
+    bool expected;
+  };
+  template <size_t N>
+  void ExpectQuery(const QueryCase (&cases)[N], bool (QueueMgr::*query)(const std::string&) const) {
+    for (const auto& c : cases) {
+      remove(queue_.c_str());
+      remove(side_.c_str());
+      if (!c.live.empty()) testing::WriteFile(queue_, c.live + "\n");
+      if (!c.side.empty()) testing::WriteFile(side_, c.side + "\n");
+      EXPECT_EQ((mgr_.*query)(c.query), c.expected)
+          << "live: " << c.live << ", side: " << c.side << ", query: " << c.query;
+    }
+  }
 };
 
 TEST_F(QueueMgrTest, NoQueueAndNoSideFileProcessNothing) {
@@ -107,9 +126,10 @@ TEST_F(QueueMgrTest, QueueThatIsNotARegularFileIsRefusedWithoutHanging) {
     void (*make)(const std::string& path, const std::string& target);
   } cases[] = {
       {"missing", [](const std::string&, const std::string&) {}},
-      {"symbolic link",
-       [](const std::string& p, const std::string& t) { ASSERT_EQ(symlink(t.c_str(), p.c_str()), 0); }},
-      {"FIFO", [](const std::string& p, const std::string&) { ASSERT_EQ(mkfifo(p.c_str(), 0644), 0); }},
+      {"symbolic link", [](const std::string& p,
+                           const std::string& t) { ASSERT_EQ(symlink(t.c_str(), p.c_str()), 0); }},
+      {"FIFO",
+       [](const std::string& p, const std::string&) { ASSERT_EQ(mkfifo(p.c_str(), 0644), 0); }},
       {"directory", [](const std::string& p, const std::string&) { testing::MakeDirs(p); }},
   };
   for (const auto& c : cases) {
@@ -189,12 +209,7 @@ TEST_F(QueueMgrTest, LineJustUnderOneMebibyteIsRead) {
 }
 
 TEST_F(QueueMgrTest, FindsAReindexOnThePathOrAnAncestorOnly) {
-  struct Case {
-    std::string live;
-    std::string side;
-    std::string query;
-    bool expected;
-  } cases[] = {
+  const QueryCase cases[] = {
       {R"({"event":65536,"path":"/volume1/s/a"})", "", "/volume1/s/a/b", true},
       {R"({"event":65536,"path":"/volume1/s/a"})", "", "/volume1/s/a", true},
       {R"({"event":65536,"path":"/volume1/s/a"})", "", "/volume1/s", false},
@@ -206,23 +221,11 @@ TEST_F(QueueMgrTest, FindsAReindexOnThePathOrAnAncestorOnly) {
        "/volume1/s/a/b", true},
       {"", "", "/volume1/s/a", false},
   };
-  for (const auto& c : cases) {
-    remove(queue_.c_str());
-    remove(side_.c_str());
-    if (!c.live.empty()) testing::WriteFile(queue_, c.live + "\n");
-    if (!c.side.empty()) testing::WriteFile(side_, c.side + "\n");
-    EXPECT_EQ(mgr_.IsFullPathHasReindex(c.query), c.expected)
-        << "live: " << c.live << ", side: " << c.side << ", query: " << c.query;
-  }
+  ExpectQuery(cases, &QueueMgr::IsFullPathHasReindex);
 }
 
 TEST_F(QueueMgrTest, FindsPendingWorkAtOrBelowAPathByWholeComponents) {
-  struct Case {
-    std::string live;
-    std::string side;
-    std::string query;
-    bool expected;
-  } cases[] = {
+  const QueryCase cases[] = {
       {Modify("/volume1/s/ab"), "", "/volume1/s/a", false},
       {Modify("/volume1/s/a"), "", "/volume1/s/a", true},
       {Modify("/volume1/s/a/x"), "", "/volume1/s/a", true},
@@ -234,14 +237,7 @@ TEST_F(QueueMgrTest, FindsPendingWorkAtOrBelowAPathByWholeComponents) {
       {"not json", Modify("/volume1/s/a/z"), "/volume1/s/a", true},
       {"not json", "", "/volume1/s/a", false},
   };
-  for (const auto& c : cases) {
-    remove(queue_.c_str());
-    remove(side_.c_str());
-    if (!c.live.empty()) testing::WriteFile(queue_, c.live + "\n");
-    if (!c.side.empty()) testing::WriteFile(side_, c.side + "\n");
-    EXPECT_EQ(mgr_.IsFullPathProcessing(c.query), c.expected)
-        << "live: " << c.live << ", side: " << c.side << ", query: " << c.query;
-  }
+  ExpectQuery(cases, &QueueMgr::IsFullPathProcessing);
 }
 
 }  // namespace
