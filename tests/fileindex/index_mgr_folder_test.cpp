@@ -18,10 +18,10 @@
 namespace vellis::fileindex {
 namespace {
 
-using testing::ErrorText;
 using testing::FakeSearchDaemon;
 using testing::IndexMgrEnv;
 using testing::MakeDirs;
+using testing::Thrown;
 using Call = testing::FakeServicesPlatform::ServiceCall;
 
 Json::Value Array(std::vector<Json::Value> items) {
@@ -214,7 +214,7 @@ TEST_F(FolderOpsTest, RefusedRequestsChangeNothing) {
        "903 Path cannot index: /photo/nope"},
   };
   for (const Case& c : cases) {
-    std::string error = ErrorText([&] { FolderUpsert(c.folders, c.create, false); });
+    std::string error = Thrown([&] { FolderUpsert(c.folders, c.create, false); });
     if (c.error.empty()) {
       EXPECT_NE(error, "no error") << c.what;
     } else {
@@ -230,21 +230,21 @@ TEST_F(FolderOpsTest, RefusedRequestsChangeNothing) {
     EXPECT_TRUE(env_.QueueEvents("music2").empty()) << c.what;
   }
   env_.platform().SetQuota(false, sdk::kPlatformErrNoSpace);
-  EXPECT_EQ(ErrorText([&] { FolderAdd(Array({F("/photo/a")}), false); }),
+  EXPECT_EQ(Thrown([&] { FolderAdd(Array({F("/photo/a")}), false); }),
             "1003 Share (photo) space not enough");
   EXPECT_FALSE(env_.FoldersFileSaved());
   EXPECT_TRUE(env_.platform().ServiceCalls().empty());
   EXPECT_EQ(NewSearchCommands(), std::vector<std::string>{});
   // The element without a path names what it lacks.
   EXPECT_EQ(
-      ErrorText([&] { FolderAdd(Array({Json::Value(Json::objectValue)}), false); }).substr(0, 30),
+      Thrown([&] { FolderAdd(Array({Json::Value(Json::objectValue)}), false); }).substr(0, 30),
       "120 Missing property: path, da");
 }
 
 TEST_F(FolderOpsTest, AFailedIndexCreationKeepsEarlierSharesDoneAndTheListUnsaved) {
   env_.search().Push(FakeSearchDaemon::Success());
   env_.search().Push(FakeSearchDaemon::Failure(1234, "no index for you"));
-  std::string error = ErrorText([&] { FolderAdd(Array({F("/photo/a"), F("/music/x")}), false); });
+  std::string error = Thrown([&] { FolderAdd(Array({F("/photo/a"), F("/music/x")}), false); });
   EXPECT_EQ(error.substr(0, 5), "1234 ") << error;
   EXPECT_TRUE(env_.FoldersFile().isNull()) << "list saved";
   // music (first by name) is done: its index and monitor configuration stay.
@@ -259,7 +259,7 @@ TEST_F(FolderOpsTest, AFailedIndexCreationKeepsEarlierSharesDoneAndTheListUnsave
 
 TEST_F(FolderOpsTest, AFailedMonitorUpdateLeavesTheListUnsaved) {
   env_.platform().FailCall("MonitorQueueUpsert", EIO, env_.QueuePath("photo"));
-  EXPECT_EQ(ErrorText([&] {
+  EXPECT_EQ(Thrown([&] {
               FolderAdd(Array({F("/photo/a"), F("/music/x")}), false);
             }),
             "502 MonitorQueue::Upsert failed, share=photo");
@@ -279,7 +279,7 @@ TEST_F(FolderOpsTest, AFailedMonitorUpdateLeavesTheListUnsaved) {
 TEST_F(FolderOpsTest, AnUnreachableDaemonLeavesTheListSavedAndNothingQueued) {
   env_.daemon().SetAnswerBytes("");
   env_.daemon().SetCloseAfterAnswer(true);
-  EXPECT_EQ(ErrorText([&] { FolderAdd(Array({F("/photo/a")}), false); }).substr(0, 4), "502 ");
+  EXPECT_EQ(Thrown([&] { FolderAdd(Array({F("/photo/a")}), false); }).substr(0, 4), "502 ");
   EXPECT_EQ(env_.FolderPaths(), std::vector<std::string>{"/photo/a"});
   EXPECT_TRUE(env_.QueueEvents("photo").empty());
 }
@@ -334,7 +334,7 @@ TEST_F(FolderOpsTest, GetReadsOneFolderOrFailsWith902) {
   EXPECT_EQ(result["path"], "/photo/a");
   EXPECT_EQ(result["document"], false);
   EXPECT_EQ(result["photo"], true);
-  EXPECT_EQ(ErrorText([&] { FolderGet(result, "/photo/b"); }), "902 /photo/b");
+  EXPECT_EQ(Thrown([&] { FolderGet(result, "/photo/b"); }), "902 /photo/b");
 }
 
 TEST_F(FolderOpsTest, DeletingOneOfTwoFoldersRewritesTheMonitorAndQueuesWhatChanged) {
@@ -380,7 +380,7 @@ TEST_F(FolderOpsTest, DeletingAnUnknownOrEmptyPathChangesNothing) {
                {"/photo/a/", "902 /photo/a/"},
                {"/photo", "902 /photo"}};
   for (const Case& c : cases) {
-    EXPECT_EQ(ErrorText([&] { FolderDelete(c.path); }), c.error) << c.path;
+    EXPECT_EQ(Thrown([&] { FolderDelete(c.path); }), c.error) << c.path;
   }
   EXPECT_FALSE(env_.FoldersFileSaved());
   EXPECT_EQ(NewDaemonCommands(), std::vector<std::string>{});
@@ -391,7 +391,7 @@ TEST_F(FolderOpsTest, DeletingAnUnknownOrEmptyPathChangesNothing) {
 TEST_F(FolderOpsTest, AFailedMonitorRemovalKeepsTheFolderListed) {
   Given(Array({F("/photo/a")}));
   env_.platform().FailCall("MonitorQueueDelete", EIO);
-  EXPECT_EQ(ErrorText([&] { FolderDelete("/photo/a"); }),
+  EXPECT_EQ(Thrown([&] { FolderDelete("/photo/a"); }),
             "502 MonitorQueue::Delete failed, share=photo");
   EXPECT_EQ(env_.FolderPaths(), std::vector<std::string>{"/photo/a"});
   EXPECT_EQ(NewSearchCommands(), std::vector<std::string>{});
@@ -427,7 +427,7 @@ TEST_F(FolderOpsTest, BadReindexRequestsChangeNothing) {
       {Array({"/photo/a", "/photo/zzz"}), "902 /photo/zzz"},
   };
   for (const Case& c : cases) {
-    EXPECT_EQ(ErrorText([&] { FolderReindex(c.paths); }), c.error) << c.paths;
+    EXPECT_EQ(Thrown([&] { FolderReindex(c.paths); }), c.error) << c.paths;
   }
   EXPECT_EQ(StatusMgr().GetShareStatus("photo"), kShareStatusNeedReindex);
   EXPECT_EQ(env_.QueueEvents("photo").size(), 1u);

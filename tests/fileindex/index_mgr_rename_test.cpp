@@ -17,9 +17,9 @@
 namespace vellis::fileindex {
 namespace {
 
-using testing::ErrorText;
 using testing::IndexMgrEnv;
 using testing::MakeDirs;
+using testing::Thrown;
 
 class RenameOpsTest : public ::testing::Test {
  protected:
@@ -88,7 +88,7 @@ TEST_F(RenameOpsTest, MissingNamesAreRefusedBeforeAnythingIsLoaded) {
       {[] { ShareRename("", "x"); }, "120 Missing share_from"},
       {[] { ShareRename("homes", ""); }, "120 Missing share_to"},
   };
-  for (const Case& c : cases) EXPECT_EQ(ErrorText(c.op), c.error);
+  for (const Case& c : cases) EXPECT_EQ(Thrown(c.op), c.error);
   EXPECT_FALSE(env_.FoldersFileSaved());
   EXPECT_EQ(env_.QueueEvents("homes").size(), 1u);
 }
@@ -134,7 +134,7 @@ TEST_F(RenameOpsTest, ShareRenameWithoutFoldersStillRenamesTheIndexAndQueues) {
 TEST_F(RenameOpsTest, ShareRenameToAShareThatDoesNotExistFailsAfterSaving) {
   Add({"/homes/alice"});
   env_.MarkFoldersFile();
-  EXPECT_EQ(ErrorText([] { ShareRename("homes", "nosuch"); }).substr(0, 4), "800 ");
+  EXPECT_EQ(Thrown([] { ShareRename("homes", "nosuch"); }).substr(0, 4), "800 ");
   EXPECT_TRUE(env_.FoldersFileSaved());
   EXPECT_EQ(env_.FolderPaths(), std::vector<std::string>{"/nosuch/alice"});
   EXPECT_EQ(env_.SearchCommands(), std::vector<std::string>{"index_create fileindex_homes"});
@@ -198,7 +198,7 @@ TEST_F(RenameOpsTest, ShareRecycleCheckQueuesOnlyForARealDirectory) {
   ASSERT_EQ(symlink(elsewhere.c_str(), photo.c_str()), 0);
   ShareCheckRecycle("photo");
   EXPECT_EQ(env_.QueueEvents("photo").size(), 1u);
-  EXPECT_EQ(ErrorText([] { ShareCheckRecycle("nosuch"); }).substr(0, 4), "800 ");
+  EXPECT_EQ(Thrown([] { ShareCheckRecycle("nosuch"); }).substr(0, 4), "800 ");
 }
 
 }  // namespace

@@ -16,9 +16,9 @@
 namespace vellis::fileindex {
 namespace {
 
-using testing::ErrorText;
 using testing::IndexMgrEnv;
 using testing::MakeDirs;
+using testing::Thrown;
 using testing::WriteFile;
 using Call = testing::FakeServicesPlatform::ServiceCall;
 
@@ -156,7 +156,7 @@ TEST_F(ServicesTest, MonitorChangesOfUnknownSharesOrRefusedByTheMonitorFail) {
   env_.platform().FailCall("MonitorQueueUpsert", EIO);
   env_.platform().FailCall("MonitorQueueDelete", EIO);
   for (const Case& c : cases) {
-    std::string error = ErrorText(c.op);
+    std::string error = Thrown(c.op);
     EXPECT_EQ(error.substr(0, c.error.size()), c.error) << c.what << ": " << error;
   }
   EXPECT_TRUE(env_.MonitorQueues().isNull());
@@ -188,7 +188,7 @@ TEST_F(ServicesTest, CleaningIndexDataRemovesQueuesAndDatabaseAndClearsTheStatus
 TEST_F(ServicesTest, CleaningStopsAtAPathThatCannotBeComposed) {
   StatusMgr().SetShareStatus("music", kShareStatusNeedReindex);
   env_.platform().FailCall("FILEIDXQueuePathCompose", EINVAL);
-  EXPECT_EQ(ErrorText([] { CleanShareIndexData("music", "relative/music"); }),
+  EXPECT_EQ(Thrown([] { CleanShareIndexData("music", "relative/music"); }),
             "502 FILEIDXQueuePathCompose failed, share_path=relative/music");
   EXPECT_TRUE(env_.platform().Execs().empty());
   EXPECT_EQ(StatusMgr().GetShareStatus("music"), kShareStatusNeedReindex);

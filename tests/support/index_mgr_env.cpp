@@ -145,4 +145,11 @@ size_t IndexMgrEnv::CallCount(const std::string& call) const {
   return n;
 }
 
+std::vector<FakeServicesPlatform::ServiceCall> ServicesStoppedCalls() {
+  return {{"QORUSMBSetSpotlight", "0"},
+          {"QLIBServiceRestart", "samba"},
+          {"QLIBServiceStop", "qorucontentextractd"},
+          {"QLIBServicectlStop", "pkg-Vellis-fileindexd"}};
+}
+
 }  // namespace vellis::testing

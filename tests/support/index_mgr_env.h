@@ -16,20 +16,13 @@
 #include "tests/support/fake_search_daemon.h"
 #include "tests/support/fake_services_platform.h"
 #include "tests/support/temp_root.h"
+#include "tests/support/thrown.h"
 
 namespace vellis::testing {
 
-// "<code> <reason>" of the vellis::Error that `fn` throws; "no error" when
-// it returns.
-template <typename Fn>
-std::string ErrorText(Fn fn) {
-  try {
-    fn();
-  } catch (const Error& e) {
-    return std::to_string(static_cast<int>(e.GetCode())) + " " + e.what();
-  }
-  return "no error";
-}
+// The service calls made when the last indexed folder goes: file sharing
+// stops offering search, and the indexing services stop.
+std::vector<FakeServicesPlatform::ServiceCall> ServicesStoppedCalls();
 
 class IndexMgrEnv {
  public:
