@@ -25,16 +25,19 @@ bool IsLive(const std::shared_ptr<OP>& e) {
 // ".." components are refused as well, so that no event names a path that
 // resolves elsewhere.
 bool IsCanonicalPath(const std::string& path) {
-  if (path.size() < 2 || path.size() > OPTree::kMaxPathBytes || path[0] != '/') return false;
-  size_t start = 1;
-  for (;;) {
-    size_t end = path.find('/', start);
-    size_t len = (end == std::string::npos ? path.size() : end) - start;
-    if (len == 0) return false;
-    if (path[start] == '.' && (len == 1 || (len == 2 && path[start + 1] == '.'))) return false;
-    if (end == std::string::npos) return true;
-    start = end + 1;
+  const size_t n = path.size();
+  if (n < 2 || n > OPTree::kMaxPathBytes || path[0] != '/' || path[n - 1] == '/') return false;
+  // One pass: each "/" starts a component, which must not be empty, "." or "..".
+  const char* p = path.data();
+  for (size_t i = 0; i < n; ++i) {
+    if (p[i] != '/') continue;
+    const char* c = p + i + 1;  // the component after this slash; the path does not end here
+    if (c[0] == '/') return false;
+    if (c[0] == '.' && (i + 2 == n || c[1] == '/' || (c[1] == '.' && (i + 3 == n || c[2] == '/')))) {
+      return false;
+    }
   }
+  return true;
 }
 
 // Visits the operations pending on `node` when the visit starts, in
@@ -63,22 +66,24 @@ Event::Event(const std::string& event_raw) { Assign(event_raw); }
 
 namespace {
 
-// The members of a queue line that an event reads, found in one walk over
-// the object.
+// The members of a queue line that an event reads.
 struct EventMembers {
   const Json::Value* event = nullptr;
   const Json::Value* is_dir = nullptr;
   const Json::Value* path = nullptr;
   const Json::Value* path_old = nullptr;
-  const Json::Value* data = nullptr;
+  Json::Value* data = nullptr;
 };
 
-EventMembers FindEventMembers(const Json::Value& root) {
+// Finds them in one walk over the object: a line has three to five members,
+// and a walk costs less than five map lookups.
+EventMembers FindEventMembers(Json::Value& root) {
   EventMembers m;
-  for (auto it = root.begin(); it != root.end(); ++it) {
-    const char* end = nullptr;
-    const char* name = it.memberName(&end);
-    const std::string_view key(name, static_cast<size_t>(end - name));
+  const auto end = root.end();
+  for (auto it = root.begin(); it != end; ++it) {
+    const char* name_end = nullptr;
+    const char* name = it.memberName(&name_end);
+    const std::string_view key(name, static_cast<size_t>(name_end - name));
     if (key == "path") {
       m.path = &*it;
     } else if (key == "event") {
@@ -116,13 +121,12 @@ void Event::Assign(const std::string& event_raw) {
   Json::Value root;
   VELLIS_THROW_IF(!JsonFromString(root, event_raw), kErrMalformedEvent,
                   "Malformed event_raw: " + event_raw);
-  // A queue round reads a million lines: the members are found in one walk
-  // and read in place. Whatever the walk cannot take (not an object, a
-  // missing or mistyped required member) goes to the JSON helper, which
-  // throws its usual error.
+  // Members are read in place; whatever the walk cannot take (not an
+  // object, a missing or mistyped required member) goes to the JSON helper,
+  // which throws its usual error.
   EventMembers m;
   if (root.isObject()) m = FindEventMembers(root);
-  if (m.event != nullptr && m.event->isConvertibleTo(Json::uintValue)) {
+  if (m.event != nullptr && m.event->isUInt()) {
     event = m.event->asUInt();
   } else {
     GetJsonValue(event, root, "event", true);
@@ -131,9 +135,10 @@ void Event::Assign(const std::string& event_raw) {
            m.is_dir->asBool();
   if (!AssignString(path, m.path)) GetJsonValue(path, root, "path", true);
   if (!AssignString(path_old, m.path_old)) path_old.clear();
+  // The parsed line is ours: its data moves rather than being copied.
   if (m.data != nullptr) {
-    data = *m.data;
-  } else {
+    data.swap(*m.data);
+  } else if (!data.isNull()) {
     data = Json::Value();
   }
 }
@@ -197,9 +202,21 @@ OPNode* OPNode::FindChild(std::string_view child_name) {
   return child_index_->Find(child_name, ChildIndex::Hash(child_name));
 }
 
+OPNode* OPNode::AppendChild(std::shared_ptr<OPNode> child) {
+  children.push_back(std::move(child));
+  OPNode* c = children.back().get();
+  // A new child joins the index at once, while its name is at hand. Its
+  // name was just looked up in vain, so it is not indexed yet.
+  if (child_index_ && child_index_->indexed + 1 == children.size()) {
+    child_index_->Insert(c, ChildIndex::Hash(c->name));
+    ++child_index_->indexed;
+  }
+  return c;
+}
+
 std::shared_ptr<OPNode> OPNode::GetChild(const std::string& child_name) {
   if (OPNode* c = FindChild(child_name)) return c->shared_from_this();
-  children.push_back(std::make_shared<OPNode>(shared_from_this(), child_name));
+  AppendChild(std::make_shared<OPNode>(shared_from_this(), child_name));
   return children.back();
 }
 
@@ -229,22 +246,39 @@ OPTree::~OPTree() {
 }
 
 void OPTree::Clear() {
-  // Break every downward link first, collecting the nodes breadth first
-  // (ancestors before descendants), then release them from the back, so
-  // that no destructor recurses down or up a long chain. Parent links stay:
-  // an operation kept by a caller still knows its path.
+  // Depth first, with an explicit stack: a node's operations go when the
+  // node is reached, and its children when the last of them is done, while
+  // they are still in the cache. A child dies there (unless a caller holds
+  // one of its operations), which only drops a reference to its parent: no
+  // destructor recurses down or up a long chain. Parent links stay, so an
+  // operation kept by a caller still knows its path.
   spare_op_.reset();
-  std::vector<std::shared_ptr<OPNode>> nodes;
-  if (root) nodes.push_back(std::move(root));
-  for (size_t i = 0; i < nodes.size(); ++i) {
-    OPNode* n = nodes[i].get();
-    for (auto& child : n->children) nodes.push_back(std::move(child));
-    n->children.clear();
-    n->ops.clear();
-  }
   ops.clear();
-  while (!nodes.empty()) nodes.pop_back();
-  last_dir_ = nullptr;
+  last_node_ = nullptr;
+  if (!root) return;
+  struct Frame {
+    OPNode* node;
+    size_t next;  // the next child to descend into
+  };
+  std::vector<Frame> stack;
+  root->ops.clear();
+  stack.push_back({root.get(), 0});
+  while (!stack.empty()) {
+    Frame& top = stack.back();
+    const auto& children = top.node->children;
+    if (top.next < children.size()) {
+      // Siblings lie apart in memory: the next ones are fetched early.
+      if (top.next + 2 < children.size()) __builtin_prefetch(children[top.next + 2].get());
+      if (top.next + 1 < children.size()) __builtin_prefetch(children[top.next + 1]->ops.data());
+      OPNode* child = children[top.next++].get();
+      child->ops.clear();
+      stack.push_back({child, 0});
+    } else {
+      top.node->children.clear();
+      stack.pop_back();
+    }
+  }
+  root.reset();
 }
 
 void OPTree::BuildTree() {
@@ -253,7 +287,7 @@ void OPTree::BuildTree() {
                   std::string("Failed to open queue, reason=") + strerror(errno));
   std::string_view line;
   std::string raw;  // reused: one line at a time, no allocation per line
-  auto event = std::make_shared<Event>();  // likewise; InsertEvent keeps no reference
+  Event event;  // likewise
   for (;;) {
     LineReader::Status status = reader.Next(&line);
     if (status == LineReader::Status::kEnd) break;
@@ -267,8 +301,8 @@ void OPTree::BuildTree() {
     }
     VELLIS_LOG_DEBUG("Got event: %s", raw.c_str());
     try {
-      event->Assign(raw);
-      InsertEvent(event);
+      event.Assign(raw);
+      Insert(event);
     } catch (const Error& e) {
       VELLIS_LOG_ERRNO("InsertEvent failed, event_raw=%s, code=%d, reason=%s", raw.c_str(),
                        static_cast<int>(e.GetCode()), e.what());
@@ -277,30 +311,36 @@ void OPTree::BuildTree() {
   }
 }
 
-std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
+OPNode* OPTree::NodeByPath(const std::string& path) {
+  // Half the lines of a busy queue name the path of the line before (a new
+  // file is created, written and has its times set), and that path was
+  // checked when it was looked up.
+  if (last_node_ != nullptr && path == last_path_) return last_node_;
   VELLIS_THROW_IF(!IsCanonicalPath(path), kErrNodeByPath, "GetNodeByPath failed, path=" + path);
   const size_t cut = path.rfind('/');
-  const std::string_view dir(path.data(), cut);
-  OPNode* parent = last_dir_;
-  if (parent == nullptr || dir != last_dir_path_) {
+  OPNode* parent = last_node_ != nullptr ? last_node_->parent.get() : nullptr;
+  if (parent == nullptr || cut != last_path_.rfind('/') ||
+      path.compare(0, cut, last_path_, 0, cut) != 0) {
     parent = root.get();
     for (size_t start = 1; start < cut;) {
       const size_t end = path.find('/', start);
       parent = ChildOf(parent, std::string_view(path.data() + start, end - start));
       start = end + 1;
     }
-    last_dir_ = parent;
-    last_dir_path_.assign(dir);
   }
-  return ChildOf(parent, std::string_view(path.data() + cut + 1, path.size() - cut - 1))
-      ->shared_from_this();
+  last_node_ = ChildOf(parent, std::string_view(path.data() + cut + 1, path.size() - cut - 1));
+  last_path_ = path;
+  return last_node_;
+}
+
+std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
+  return NodeByPath(path)->shared_from_this();
 }
 
 OPNode* OPTree::ChildOf(OPNode* node, std::string_view name) {
   if (OPNode* child = node->FindChild(name)) return child;
-  node->children.push_back(std::allocate_shared<OPNode>(
+  return node->AppendChild(std::allocate_shared<OPNode>(
       ArenaAllocator<OPNode>(arena_), node->shared_from_this(), std::string(name)));
-  return node->children.back().get();
 }
 
 void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,
@@ -323,20 +363,29 @@ unsigned int OPTree::ProcessOP(const std::function<void(std::shared_ptr<OP>)>& f
   return static_cast<unsigned int>(ops.size());
 }
 
-std::shared_ptr<OP> OPTree::NewOp(const std::shared_ptr<OPNode>& node) {
+std::shared_ptr<OP> OPTree::NewOp(OPNode* node) {
   // Most lines of a busy queue merge into work already pending, and their
-  // operation is never attached: the next line reuses it rather than leave
-  // it unused in the arena.
-  if (spare_op_ && spare_op_.use_count() == 1) {
-    spare_op_->node = node;
-    spare_op_->op = FILE_INDEX_OP_NONE;
-    spare_op_->path_old.clear();
-    spare_op_->data = Json::Value();
+  // operation is never attached: the next line reuses it (see Recycle),
+  // rather than leave it unused in the arena. The spare is moved, not
+  // copied, and keeps its node when the line names the same path, so that
+  // such a line touches no reference count.
+  std::shared_ptr<OP> op = std::move(spare_op_);
+  if (op && op.use_count() == 1) {
+    if (op->node.get() != node) op->node = node->shared_from_this();
+    op->op = FILE_INDEX_OP_NONE;
+    op->path_old.clear();
+    if (!op->data.isNull()) op->data = Json::Value();
   } else {
-    spare_op_ =
-        std::allocate_shared<OP>(ArenaAllocator<OP>(arena_), node, FILE_INDEX_OP_NONE, "", Json::Value());
+    static const std::string kNoPath;
+    static const Json::Value kNoData;
+    op = std::allocate_shared<OP>(ArenaAllocator<OP>(arena_), node->shared_from_this(),
+                                  FILE_INDEX_OP_NONE, kNoPath, kNoData);
   }
-  return spare_op_;
+  return op;
+}
+
+void OPTree::Recycle(std::shared_ptr<OP> op) {
+  if (op.use_count() == 1) spare_op_ = std::move(op);
 }
 
 void OPTree::Attach(const std::shared_ptr<OP>& op) {
@@ -344,14 +393,16 @@ void OPTree::Attach(const std::shared_ptr<OP>& op) {
   op->node->ops.push_back(op);
 }
 
-void OPTree::InsertEvent(std::shared_ptr<Event> event) {
-  std::shared_ptr<OPNode> node = GetNodeByPath(event->path);
+void OPTree::InsertEvent(std::shared_ptr<Event> event) { Insert(*event); }
+
+void OPTree::Insert(const Event& event) {
+  OPNode* node = NodeByPath(event.path);
   // One operation object serves every bit of the line; a later bit's rule
   // may meet it among the node's pending operations and rewrite or cancel it.
   std::shared_ptr<OP> op = NewOp(node);
-  const uint32_t bits = event->event;
+  const uint32_t bits = event.event;
   if (bits & kEventCreate) {
-    if (event->is_dir) {
+    if (event.is_dir) {
       HandleReindex(node, op);
     } else {
       HandleCreate(node, op);
@@ -360,29 +411,30 @@ void OPTree::InsertEvent(std::shared_ptr<Event> event) {
   if (bits & kEventAttr) HandleAttr(node, op);
   if (bits & kEventModify) HandleModify(node, op);
   if (bits & kEventDelete) {
-    if (event->is_dir) {
+    if (event.is_dir) {
       HandleReindex(node, op);
     } else {
       HandleDelete(node, op);
     }
   }
   if (bits & kEventRename) {
-    op->path_old = event->path_old;
+    op->path_old = event.path_old;
     HandleRename(node, op);
   }
   if (bits & kEventReindex) HandleReindex(node, op);
   if (bits & kEventUpdateCfg) {
-    op->data = event->data;
+    op->data = event.data;
     HandleUpdateCfg(node, op);
   }
   if (bits & kEventCrash) crashed = true;
+  Recycle(std::move(op));
 }
 
 // In every handler: `op` takes the handler's kind, meets each pending
 // operation `e` of the node in attachment order (all of them: a traversal
 // does not stop at a match), and is attached when still not cancelled.
 
-void OPTree::HandleCreate(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
+void OPTree::HandleCreate(OPNode* node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_UPSERT;
   ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
@@ -401,7 +453,7 @@ void OPTree::HandleCreate(const std::shared_ptr<OPNode>& node, const std::shared
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleModify(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
+void OPTree::HandleModify(OPNode* node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_UPSERT;
   ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
@@ -419,7 +471,7 @@ void OPTree::HandleModify(const std::shared_ptr<OPNode>& node, const std::shared
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleDelete(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
+void OPTree::HandleDelete(OPNode* node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_DELETE;
   ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
@@ -439,7 +491,7 @@ void OPTree::HandleDelete(const std::shared_ptr<OPNode>& node, const std::shared
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleAttr(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
+void OPTree::HandleAttr(OPNode* node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_ATTR;
   ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (IsLive(e) && e->op != FILE_INDEX_OP_RENAME) op->op = FILE_INDEX_OP_NONE;
@@ -447,7 +499,7 @@ void OPTree::HandleAttr(const std::shared_ptr<OPNode>& node, const std::shared_p
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleUpdateCfg(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
+void OPTree::HandleUpdateCfg(OPNode* node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_UPDATE_CFG;
   ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
@@ -471,7 +523,7 @@ void OPTree::HandleUpdateCfg(const std::shared_ptr<OPNode>& node, const std::sha
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::HandleReindex(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
+void OPTree::HandleReindex(OPNode* node, const std::shared_ptr<OP>& op) {
   op->op = FILE_INDEX_OP_REINDEX;
   ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
     if (!IsLive(e)) return;
@@ -491,7 +543,7 @@ void OPTree::HandleReindex(const std::shared_ptr<OPNode>& node, const std::share
   // A reindex swallows the work below it, except renames, which must still
   // move documents.
   TraverseNodeDescendant(
-      node,
+      node->shared_from_this(),
       [](std::shared_ptr<OPNode> n) {
         for (auto& e : n->ops) {
           if (e->op != FILE_INDEX_OP_RENAME) e->op = FILE_INDEX_OP_NONE;
@@ -501,7 +553,7 @@ void OPTree::HandleReindex(const std::shared_ptr<OPNode>& node, const std::share
   if (op->op != FILE_INDEX_OP_NONE) Attach(op);
 }
 
-void OPTree::CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to) {
+void OPTree::CarryOver(OPNode* from, OPNode* to) {
   std::shared_ptr<OP> follow_up;
   ForEachPending(*from, [&](const std::shared_ptr<OP>& e) {
     if (!IsCarriable(e->op)) return;
@@ -517,10 +569,10 @@ void OPTree::CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_pt
   });
 }
 
-void OPTree::HandleRename(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op) {
+void OPTree::HandleRename(OPNode* node, const std::shared_ptr<OP>& op) {
   // Resolve the old path first: a bad one refuses the line before anything
   // changes, also the kind of `op` when an earlier bit of the line attached it.
-  std::shared_ptr<OPNode> old_node = GetNodeByPath(op->path_old);
+  OPNode* old_node = NodeByPath(op->path_old);
   op->op = FILE_INDEX_OP_RENAME;
   // Whatever was pending at the destination is superseded by the moved item.
   ForEachPending(*node, [&](const std::shared_ptr<OP>& e) {
@@ -536,12 +588,12 @@ void OPTree::HandleRename(const std::shared_ptr<OPNode>& node, const std::shared
   const std::string old_prefix = old_node->GetPath();
   const std::string new_prefix = node->GetPath();
   TraverseNodeDescendant(
-      old_node,
+      old_node->shared_from_this(),
       [&](std::shared_ptr<OPNode> d) {
         // The mirror node is made only where there is work to move, so a
         // renamed folder does not copy its whole subtree.
         if (!HasCarriableWork(*d)) return;
-        CarryOver(d, GetNodeByPath(new_prefix + d->GetPath().substr(old_prefix.size())));
+        CarryOver(d.get(), NodeByPath(new_prefix + d->GetPath().substr(old_prefix.size())));
       },
       true);
 }

@@ -124,6 +124,8 @@ struct OPNode : public std::enable_shared_from_this<OPNode> {
   friend class OPTree;
   // The first child named `name`, or null.
   OPNode* FindChild(std::string_view name);
+  // Appends a child whose name FindChild has just missed; returns it.
+  OPNode* AppendChild(std::shared_ptr<OPNode> child);
   // Made once the folder has more than a few children.
   std::unique_ptr<ChildIndex> child_index_;
 };
@@ -179,29 +181,36 @@ class OPTree {
   void Clear();
   // The child of `node` named `name`, created when missing.
   OPNode* ChildOf(OPNode* node, std::string_view name);
-  // A new operation of kind none on `node`, allocated in the arena.
-  std::shared_ptr<OP> NewOp(const std::shared_ptr<OPNode>& node);
+  // GetNodeByPath without taking a reference.
+  OPNode* NodeByPath(const std::string& path);
+  // InsertEvent without taking a reference.
+  void Insert(const Event& event);
+  // An operation of kind none on `node`: the spare one when no one else
+  // holds it, else a new one allocated in the arena.
+  std::shared_ptr<OP> NewOp(OPNode* node);
+  // Keeps `op` as the spare when it was not attached.
+  void Recycle(std::shared_ptr<OP> op);
   void Attach(const std::shared_ptr<OP>& op);
-  void HandleCreate(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
-  void HandleModify(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
-  void HandleDelete(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
-  void HandleAttr(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
-  void HandleUpdateCfg(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
-  void HandleReindex(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
-  void HandleRename(const std::shared_ptr<OPNode>& node, const std::shared_ptr<OP>& op);
+  void HandleCreate(OPNode* node, const std::shared_ptr<OP>& op);
+  void HandleModify(OPNode* node, const std::shared_ptr<OP>& op);
+  void HandleDelete(OPNode* node, const std::shared_ptr<OP>& op);
+  void HandleAttr(OPNode* node, const std::shared_ptr<OP>& op);
+  void HandleUpdateCfg(OPNode* node, const std::shared_ptr<OP>& op);
+  void HandleReindex(OPNode* node, const std::shared_ptr<OP>& op);
+  void HandleRename(OPNode* node, const std::shared_ptr<OP>& op);
   // Moves pending upsert/attr/reindex work of `from` onto `to`.
-  void CarryOver(const std::shared_ptr<OPNode>& from, const std::shared_ptr<OPNode>& to);
+  void CarryOver(OPNode* from, OPNode* to);
 
   // Nodes and operations made by the tree are allocated here. The tree holds
   // one reference and each object another, so the memory goes when the tree
   // and the last operation a caller kept are gone.
   Arena* arena_;
-  std::shared_ptr<OP> spare_op_;  // the last operation made; see NewOp
-  // The folder of the last path looked up: events come in bursts in one
-  // folder, and this spares the walk down to it. Nodes are not removed
-  // before Clear, which forgets it.
-  OPNode* last_dir_ = nullptr;
-  std::string last_dir_path_;
+  std::shared_ptr<OP> spare_op_;  // an operation no line attached; see NewOp
+  // The node of the last path looked up, and that path: events come in
+  // bursts on one file or in one folder, and this spares the walk down to
+  // them. Nodes are not removed before Clear, which forgets it.
+  OPNode* last_node_ = nullptr;
+  std::string last_path_;
 };
 
 // "[05] /old -> /new", "[04] /a, data={...}", "[02] /a".
