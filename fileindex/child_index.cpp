@@ -1,6 +1,8 @@
 #include "fileindex/child_index.h"
 
+#include <cstring>
 #include <functional>
+#include <new>
 
 #include "fileindex/optree.h"
 
@@ -11,7 +13,7 @@ namespace {
 static_assert(sizeof(uintptr_t) == 8, "the child index tags 64-bit pointers");
 constexpr int kTagShift = 48;
 constexpr uintptr_t kPointerMask = (uintptr_t{1} << kTagShift) - 1;
-constexpr size_t kFirstSlots = 32;
+constexpr uint32_t kFirstSlots = 8;
 
 OPNode* Untag(uintptr_t slot) { return reinterpret_cast<OPNode*>(slot & kPointerMask); }
 
@@ -30,32 +32,48 @@ uintptr_t ChildIndex::Tag(uint32_t hash) {
   return static_cast<uintptr_t>((hash * 0x9E3779B1u) >> 16) << kTagShift;
 }
 
+std::unique_ptr<ChildIndex> ChildIndex::Make() { return Make(kFirstSlots); }
+
+std::unique_ptr<ChildIndex> ChildIndex::Make(uint32_t capacity) {
+  static_assert(sizeof(ChildIndex) % alignof(uintptr_t) == 0, "slots follow the object");
+  void* mem = ::operator new(sizeof(ChildIndex) + capacity * sizeof(uintptr_t));
+  std::unique_ptr<ChildIndex> index(new (mem) ChildIndex(capacity));
+  memset(index->slots(), 0, capacity * sizeof(uintptr_t));
+  return index;
+}
+
 OPNode* ChildIndex::Find(std::string_view name, uint32_t hash) const {
-  if (slots_.empty()) return nullptr;
-  const size_t mask = slots_.size() - 1;
+  const uintptr_t* s = slots();
+  const uint32_t mask = capacity_ - 1;
   const uintptr_t tag = Tag(hash);
-  for (size_t i = hash & mask;; i = (i + 1) & mask) {
-    const uintptr_t slot = slots_[i];
+  for (uint32_t i = hash & mask;; i = (i + 1) & mask) {
+    const uintptr_t slot = s[i];
     if (slot == 0) return nullptr;
     if ((slot & ~kPointerMask) == tag && Untag(slot)->name == name) return Untag(slot);
   }
 }
 
-void ChildIndex::Insert(OPNode* child, uint32_t hash) {
-  // Linear probing stays short below three quarters full.
-  if ((used_ + 1) * 4 > slots_.size() * 3) {
-    std::vector<uintptr_t> old(slots_.empty() ? kFirstSlots : slots_.size() * 2, 0);
-    old.swap(slots_);
-    used_ = 0;
-    for (uintptr_t slot : old) {
-      if (slot != 0) Insert(Untag(slot), Hash(Untag(slot)->name));
-    }
-  }
-  const size_t mask = slots_.size() - 1;
-  size_t i = hash & mask;
-  while (slots_[i] != 0) i = (i + 1) & mask;
-  slots_[i] = Tag(hash) | (reinterpret_cast<uintptr_t>(child) & kPointerMask);
+void ChildIndex::Place(OPNode* child, uint32_t hash) {
+  uintptr_t* s = slots();
+  const uint32_t mask = capacity_ - 1;
+  uint32_t i = hash & mask;
+  while (s[i] != 0) i = (i + 1) & mask;
+  s[i] = Tag(hash) | (reinterpret_cast<uintptr_t>(child) & kPointerMask);
   ++used_;
+}
+
+void ChildIndex::Insert(std::unique_ptr<ChildIndex>& index, OPNode* child, uint32_t hash) {
+  // Linear probing stays short below three quarters full.
+  if ((index->used_ + 1) * 4 > index->capacity_ * 3) {
+    std::unique_ptr<ChildIndex> larger = Make(index->capacity_ * 2);
+    larger->indexed = index->indexed;
+    const uintptr_t* s = index->slots();
+    for (uint32_t i = 0; i < index->capacity_; ++i) {
+      if (s[i] != 0) larger->Place(Untag(s[i]), Hash(Untag(s[i])->name));
+    }
+    index = std::move(larger);
+  }
+  index->Place(child, hash);
 }
 
 }  // namespace vellis::fileindex

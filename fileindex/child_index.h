@@ -4,33 +4,50 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <string_view>
-#include <vector>
 
 namespace vellis::fileindex {
 
 struct OPNode;
 
-// Open addressing with linear probing. A slot holds a child pointer tagged
-// in its top 16 bits with bits of the name's hash, so a probe rarely visits
-// a child that does not match. The index does not own the children.
+// Open addressing with linear probing, in one allocation with its slots, so
+// that a lookup touches the index once before the child it finds. A slot
+// holds a child pointer tagged in its top 16 bits with bits of the name's
+// hash, so a probe rarely visits a child that does not match. The index
+// does not own the children.
 class ChildIndex {
  public:
   static uint32_t Hash(std::string_view name);
 
+  // An empty index.
+  static std::unique_ptr<ChildIndex> Make();
+
   // The indexed child named `name` (`hash` = Hash(name)), or null.
   OPNode* Find(std::string_view name, uint32_t hash) const;
-  // Adds a child whose name is not indexed yet.
-  void Insert(OPNode* child, uint32_t hash);
+  // Adds a child whose name is not indexed yet. A full index is replaced by
+  // a larger one, so `index` may change.
+  static void Insert(std::unique_ptr<ChildIndex>& index, OPNode* child, uint32_t hash);
 
   // How many leading entries of the node's `children` are indexed; kept by
-  // the node, which indexes appended children on its next lookup.
+  // the node, which indexes children appended behind its back on its next
+  // lookup.
   size_t indexed = 0;
 
+  // The slots follow the object in the same allocation.
+  static void operator delete(void* p) { ::operator delete(p); }
+
  private:
+  explicit ChildIndex(uint32_t capacity) : capacity_(capacity) {}
+  static std::unique_ptr<ChildIndex> Make(uint32_t capacity);
   static uintptr_t Tag(uint32_t hash);
-  std::vector<uintptr_t> slots_;
-  size_t used_ = 0;
+  uintptr_t* slots() { return reinterpret_cast<uintptr_t*>(this + 1); }
+  const uintptr_t* slots() const { return reinterpret_cast<const uintptr_t*>(this + 1); }
+  // Places a child known to be absent, in an index with room for it.
+  void Place(OPNode* child, uint32_t hash);
+
+  uint32_t capacity_;  // slots, a power of two
+  uint32_t used_ = 0;
 };
 
 }  // namespace vellis::fileindex

@@ -178,9 +178,9 @@ std::string OPNode::GetPath() const {
 
 OPNode::~OPNode() = default;
 
-// Up to this many children, a scan beats an index: names are short and the
-// children of a small folder sit close together.
-constexpr size_t kScannedChildren = 8;
+// Up to this many children, a scan beats an index. Each child scanned is
+// likely a cache miss of its own, so the index takes over early.
+constexpr size_t kScannedChildren = 4;
 
 OPNode* OPNode::FindChild(std::string_view child_name) {
   if (!child_index_) {
@@ -190,14 +190,14 @@ OPNode* OPNode::FindChild(std::string_view child_name) {
       }
       return nullptr;
     }
-    child_index_ = std::make_unique<ChildIndex>();
+    child_index_ = ChildIndex::Make();
   }
   // Children appended since the last lookup join the index; a repeated name
   // keeps its first child.
   for (; child_index_->indexed < children.size(); ++child_index_->indexed) {
     OPNode* c = children[child_index_->indexed].get();
     const uint32_t hash = ChildIndex::Hash(c->name);
-    if (child_index_->Find(c->name, hash) == nullptr) child_index_->Insert(c, hash);
+    if (child_index_->Find(c->name, hash) == nullptr) ChildIndex::Insert(child_index_, c, hash);
   }
   return child_index_->Find(child_name, ChildIndex::Hash(child_name));
 }
@@ -208,7 +208,7 @@ OPNode* OPNode::AppendChild(std::shared_ptr<OPNode> child) {
   // A new child joins the index at once, while its name is at hand. Its
   // name was just looked up in vain, so it is not indexed yet.
   if (child_index_ && child_index_->indexed + 1 == children.size()) {
-    child_index_->Insert(c, ChildIndex::Hash(c->name));
+    ChildIndex::Insert(child_index_, c, ChildIndex::Hash(c->name));
     ++child_index_->indexed;
   }
   return c;
