@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <map>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -246,7 +247,8 @@ TEST_F(OPTreeTest, GetNodeByPathRefusesPathsThatAreNotCanonical) {
   for (const std::string& bad :
        {std::string(), std::string("/"), std::string("volume1/share"), std::string("/a//b"),
         std::string("/a/"), std::string("/a/./b"), std::string("/a/../b"), std::string("/."),
-        std::string("//a"), longest + "c"}) {
+        std::string("//a"), std::string("/a/."), std::string("/.."), std::string("/a/.."),
+        std::string("/a/b//"), longest + "c"}) {
     try {
       tree.GetNodeByPath(bad);
       ADD_FAILURE() << "accepted: \"" << bad << "\"";
@@ -257,6 +259,40 @@ TEST_F(OPTreeTest, GetNodeByPathRefusesPathsThatAreNotCanonical) {
   }
   // Names that merely begin with dots are ordinary names.
   EXPECT_EQ(tree.GetNodeByPath("/a/.b/..c/...")->GetPath(), "/a/.b/..c/...");
+}
+
+// Lookups remember the last path and its folder: whatever came before, a
+// path always resolves to the one node of that path, and a refused path in
+// between changes nothing.
+TEST_F(OPTreeTest, LookupFindsTheNodeOfThePathWhateverCameBefore) {
+  OPTree tree(WriteQueue({}));
+  const std::vector<std::string> sequence = {
+      "/a/b", "/a/b", "/a//b", "/a/b", "/a/bc", "/a/b/c", "/a",    "/x",  "/a/b", "/a/b/",
+      "/a/b", "/ab/b", "/a/c", "/b/c", "/a/c", "/a/b/c", "/a/b/.", "/a/b", "/x/y", "/x"};
+  std::map<std::string, std::shared_ptr<OPNode>> seen;
+  for (const std::string& path : sequence) {
+    std::shared_ptr<OPNode> node;
+    try {
+      node = tree.GetNodeByPath(path);
+    } catch (const Error& e) {
+      EXPECT_EQ(e.GetCode(), kErrNodeByPath) << path;
+      continue;
+    }
+    EXPECT_EQ(node->GetPath(), path);
+    auto [it, fresh] = seen.emplace(path, node);
+    EXPECT_TRUE(fresh || it->second == node) << path << " resolved to a second node";
+  }
+  // Every path and prefix has exactly one node: /a /a/b /a/bc /a/b/c /a/c
+  // /x /x/y /ab /ab/b /b /b/c, and the root.
+  size_t nodes = 0;
+  std::vector<OPNode*> stack{tree.root.get()};
+  while (!stack.empty()) {
+    OPNode* n = stack.back();
+    stack.pop_back();
+    ++nodes;
+    for (const auto& c : n->children) stack.push_back(c.get());
+  }
+  EXPECT_EQ(nodes, 12u);
 }
 
 // Regression: a child made with OPNode::GetChild was unknown to the tree's
