@@ -1,7 +1,6 @@
 #include "fileindex/child_index.h"
 
 #include <cstring>
-#include <functional>
 #include <new>
 
 #include "fileindex/optree.h"
@@ -20,7 +19,8 @@ OPNode* Untag(uintptr_t slot) { return reinterpret_cast<OPNode*>(slot & kPointer
 }  // namespace
 
 uint32_t ChildIndex::Hash(std::string_view name) {
-  uint64_t h = std::hash<std::string_view>()(name);
+  uint64_t h = 0xcbf29ce484222325ULL;  // FNV-1a: names are short
+  for (unsigned char c : name) h = (h ^ c) * 0x100000001b3ULL;
   h ^= h >> 33;
   h *= 0xff51afd7ed558ccdULL;
   h ^= h >> 33;

@@ -131,8 +131,13 @@ void Event::Assign(const std::string& event_raw) {
   } else {
     GetJsonValue(event, root, "event", true);
   }
-  is_dir = m.is_dir != nullptr && m.is_dir->isConvertibleTo(Json::booleanValue) &&
-           m.is_dir->asBool();
+  if (m.is_dir == nullptr) {
+    is_dir = false;
+  } else if (m.is_dir->isBool()) {
+    is_dir = m.is_dir->asBool();
+  } else {
+    is_dir = m.is_dir->isConvertibleTo(Json::booleanValue) && m.is_dir->asBool();
+  }
   if (!AssignString(path, m.path)) GetJsonValue(path, root, "path", true);
   if (!AssignString(path_old, m.path_old)) path_old.clear();
   // The parsed line is ours: its data moves rather than being copied.
@@ -319,7 +324,7 @@ OPNode* OPTree::NodeByPath(const std::string& path) {
   VELLIS_THROW_IF(!IsCanonicalPath(path), kErrNodeByPath, "GetNodeByPath failed, path=" + path);
   const size_t cut = path.rfind('/');
   OPNode* parent = last_node_ != nullptr ? last_node_->parent.get() : nullptr;
-  if (parent == nullptr || cut != last_path_.rfind('/') ||
+  if (parent == nullptr || cut != last_cut_ ||
       path.compare(0, cut, last_path_, 0, cut) != 0) {
     parent = root.get();
     for (size_t start = 1; start < cut;) {
@@ -330,6 +335,7 @@ OPNode* OPTree::NodeByPath(const std::string& path) {
   }
   last_node_ = ChildOf(parent, std::string_view(path.data() + cut + 1, path.size() - cut - 1));
   last_path_ = path;
+  last_cut_ = cut;
   return last_node_;
 }
 

@@ -211,6 +211,7 @@ class OPTree {
   // them. Nodes are not removed before Clear, which forgets it.
   OPNode* last_node_ = nullptr;
   std::string last_path_;
+  size_t last_cut_ = 0;  // where the folder part of last_path_ ends
 };
 
 // "[05] /old -> /new", "[04] /a, data={...}", "[02] /a".
