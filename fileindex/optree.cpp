@@ -591,6 +591,7 @@ void OPTree::HandleRename(OPNode* node, const std::shared_ptr<OP>& op) {
   // before it meets any work carried over to paths under the new name.
   Attach(op);
   CarryOver(old_node, node);
+  if (old_node->children.empty()) return;  // a file: nothing below it to carry
   const std::string old_prefix = old_node->GetPath();
   const std::string new_prefix = node->GetPath();
   TraverseNodeDescendant(
