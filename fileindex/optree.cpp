@@ -125,7 +125,7 @@ void Event::Assign(const std::string& event_raw) {
   // object, a missing or mistyped required member) goes to the JSON helper,
   // which throws its usual error.
   EventMembers m;
-  if (root.isObject()) m = FindEventMembers(root);
+  if (root.type() == Json::objectValue) m = FindEventMembers(root);
   if (m.event != nullptr && m.event->isUInt()) {
     event = m.event->asUInt();
   } else {
@@ -133,7 +133,7 @@ void Event::Assign(const std::string& event_raw) {
   }
   if (m.is_dir == nullptr) {
     is_dir = false;
-  } else if (m.is_dir->isBool()) {
+  } else if (m.is_dir->type() == Json::booleanValue) {
     is_dir = m.is_dir->asBool();
   } else {
     is_dir = m.is_dir->isConvertibleTo(Json::booleanValue) && m.is_dir->asBool();
@@ -143,7 +143,7 @@ void Event::Assign(const std::string& event_raw) {
   // The parsed line is ours: its data moves rather than being copied.
   if (m.data != nullptr) {
     data.swap(*m.data);
-  } else if (!data.isNull()) {
+  } else if (data.type() != Json::nullValue) {
     data = Json::Value();
   }
 }
@@ -380,7 +380,7 @@ std::shared_ptr<OP> OPTree::NewOp(OPNode* node) {
     if (op->node.get() != node) op->node = node->shared_from_this();
     op->op = FILE_INDEX_OP_NONE;
     op->path_old.clear();
-    if (!op->data.isNull()) op->data = Json::Value();
+    if (op->data.type() != Json::nullValue) op->data = Json::Value();
   } else {
     static const std::string kNoPath;
     static const Json::Value kNoData;
