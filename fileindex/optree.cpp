@@ -44,7 +44,7 @@ bool IsCanonicalPath(const std::string& path) {
 // attachment order; a rule may attach to this very node meanwhile, and what
 // it attaches is not visited.
 template <typename Fn>
-void ForEachPending(const OPNode& node, Fn fn) {
+void ForEachPending(const OPNode& node, const Fn& fn) {
   for (size_t i = 0, n = node.ops.size(); i < n; ++i) fn(node.ops[i]);
 }
 
@@ -99,19 +99,13 @@ EventMembers FindEventMembers(Json::Value& root) {
   return m;
 }
 
-// Copies a string member into `out`'s existing storage; a member that the
-// JSON helpers would convert (null, a number, a boolean) is converted as
-// they do.
+// Copies a string member into `out`'s existing storage; false when `v` is
+// missing or not a string.
 bool AssignString(std::string& out, const Json::Value* v) {
   const char* begin = nullptr;
   const char* end = nullptr;
-  if (v == nullptr) return false;
-  if (v->getString(&begin, &end)) {
-    out.assign(begin, static_cast<size_t>(end - begin));
-    return true;
-  }
-  if (!v->isConvertibleTo(Json::stringValue)) return false;
-  out = v->asString();
+  if (v == nullptr || !v->getString(&begin, &end)) return false;
+  out.assign(begin, static_cast<size_t>(end - begin));
   return true;
 }
 
@@ -121,9 +115,9 @@ void Event::Assign(const std::string& event_raw) {
   Json::Value root;
   VELLIS_THROW_IF(!JsonFromString(root, event_raw), kErrMalformedEvent,
                   "Malformed event_raw: " + event_raw);
-  // Members are read in place; whatever the walk cannot take (not an
-  // object, a missing or mistyped required member) goes to the JSON helper,
-  // which throws its usual error.
+  // A member of its usual type is read in place; anything else (not an
+  // object, a missing member, another type) goes to the JSON helper, which
+  // converts, keeps the default or throws as it always does.
   EventMembers m;
   if (root.type() == Json::objectValue) m = FindEventMembers(root);
   if (m.event != nullptr && m.event->isUInt()) {
@@ -131,15 +125,17 @@ void Event::Assign(const std::string& event_raw) {
   } else {
     GetJsonValue(event, root, "event", true);
   }
-  if (m.is_dir == nullptr) {
-    is_dir = false;
-  } else if (m.is_dir->type() == Json::booleanValue) {
+  is_dir = false;
+  if (m.is_dir != nullptr && m.is_dir->type() == Json::booleanValue) {
     is_dir = m.is_dir->asBool();
-  } else {
-    is_dir = m.is_dir->isConvertibleTo(Json::booleanValue) && m.is_dir->asBool();
+  } else if (m.is_dir != nullptr) {
+    GetJsonValue(is_dir, root, "is_dir", false);
   }
   if (!AssignString(path, m.path)) GetJsonValue(path, root, "path", true);
-  if (!AssignString(path_old, m.path_old)) path_old.clear();
+  path_old.clear();
+  if (m.path_old != nullptr && !AssignString(path_old, m.path_old)) {
+    GetJsonValue(path_old, root, "path_old", false);
+  }
   // The parsed line is ours: its data moves rather than being copied.
   if (m.data != nullptr) {
     data.swap(*m.data);
@@ -197,26 +193,24 @@ OPNode* OPNode::FindChild(std::string_view child_name) {
     }
     child_index_ = ChildIndex::Make();
   }
-  // Children appended since the last lookup join the index; a repeated name
-  // keeps its first child.
+  IndexAppendedChildren();
+  return child_index_->Find(child_name, ChildIndex::Hash(child_name));
+}
+
+void OPNode::IndexAppendedChildren() {
+  // A repeated name keeps its first child.
   for (; child_index_->indexed < children.size(); ++child_index_->indexed) {
     OPNode* c = children[child_index_->indexed].get();
     const uint32_t hash = ChildIndex::Hash(c->name);
     if (child_index_->Find(c->name, hash) == nullptr) ChildIndex::Insert(child_index_, c, hash);
   }
-  return child_index_->Find(child_name, ChildIndex::Hash(child_name));
 }
 
 OPNode* OPNode::AppendChild(std::shared_ptr<OPNode> child) {
   children.push_back(std::move(child));
-  OPNode* c = children.back().get();
-  // A new child joins the index at once, while its name is at hand. Its
-  // name was just looked up in vain, so it is not indexed yet.
-  if (child_index_ && child_index_->indexed + 1 == children.size()) {
-    ChildIndex::Insert(child_index_, c, ChildIndex::Hash(c->name));
-    ++child_index_->indexed;
-  }
-  return c;
+  // A new child joins the index at once, while its name is at hand.
+  if (child_index_) IndexAppendedChildren();
+  return children.back().get();
 }
 
 std::shared_ptr<OPNode> OPNode::GetChild(const std::string& child_name) {
@@ -226,9 +220,7 @@ std::shared_ptr<OPNode> OPNode::GetChild(const std::string& child_name) {
 }
 
 void OPNode::TraverseOP(const std::function<void(std::shared_ptr<OP>)>& fn) {
-  // Index-based: a rule may attach to this very node while it is walked; the
-  // operations attached meanwhile are not visited.
-  for (size_t i = 0, n = ops.size(); i < n; ++i) fn(ops[i]);
+  ForEachPending(*this, fn);
 }
 
 OPTree::OPTree(const std::string& path)

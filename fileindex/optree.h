@@ -126,6 +126,8 @@ struct OPNode : public std::enable_shared_from_this<OPNode> {
   OPNode* FindChild(std::string_view name);
   // Appends a child whose name FindChild has just missed; returns it.
   OPNode* AppendChild(std::shared_ptr<OPNode> child);
+  // Adds the children appended since the last lookup to child_index_.
+  void IndexAppendedChildren();
   // Made once the folder has more than a few children.
   std::unique_ptr<ChildIndex> child_index_;
 };
