@@ -58,6 +58,10 @@ bool WriteAll(int fd, const std::string& data) {
 }  // namespace
 
 bool JsonFromString(Json::Value& out, const std::string& text) {
+  return JsonFromChars(out, text);
+}
+
+bool JsonFromChars(Json::Value& out, std::string_view text) {
   // Valid JSON text holds no raw NUL; jsoncpp would let one through inside a
   // string, and jsoncpp does not check UTF-8 at all.
   if (memchr(text.data(), '\0', text.size()) != nullptr) return false;

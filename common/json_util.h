@@ -8,6 +8,7 @@
 #include <json/json.h>
 
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "common/error.h"
@@ -19,6 +20,9 @@ namespace vellis {
 // on text that is not well-formed UTF-8, and on nesting deeper than 1000.
 // Never throws. Thread-safe.
 bool JsonFromString(Json::Value& out, const std::string& text);
+// The same for text that is not held in a std::string (a line of a file
+// being read, say), without copying it.
+bool JsonFromChars(Json::Value& out, std::string_view text);
 
 // `v` as compact JSON text on one line (no newline), UTF-8 not escaped.
 std::string JsonToString(const Json::Value& v);

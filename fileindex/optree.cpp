@@ -109,40 +109,44 @@ bool AssignString(std::string& out, const Json::Value* v) {
   return true;
 }
 
-}  // namespace
-
-void Event::Assign(const std::string& event_raw) {
+// Event::Assign for text that the caller holds elsewhere (a line of the
+// queue, as the reader hands it out), so that it is not copied first.
+void AssignEvent(Event& e, std::string_view event_raw) {
   Json::Value root;
-  VELLIS_THROW_IF(!JsonFromString(root, event_raw), kErrMalformedEvent,
-                  "Malformed event_raw: " + event_raw);
+  VELLIS_THROW_IF(!JsonFromChars(root, event_raw), kErrMalformedEvent,
+                  "Malformed event_raw: " + std::string(event_raw));
   // A member of its usual type is read in place; anything else (not an
   // object, a missing member, another type) goes to the JSON helper, which
   // converts, keeps the default or throws as it always does.
   EventMembers m;
   if (root.type() == Json::objectValue) m = FindEventMembers(root);
   if (m.event != nullptr && m.event->isUInt()) {
-    event = m.event->asUInt();
+    e.event = m.event->asUInt();
   } else {
-    GetJsonValue(event, root, "event", true);
+    GetJsonValue(e.event, root, "event", true);
   }
-  is_dir = false;
+  e.is_dir = false;
   if (m.is_dir != nullptr && m.is_dir->type() == Json::booleanValue) {
-    is_dir = m.is_dir->asBool();
+    e.is_dir = m.is_dir->asBool();
   } else if (m.is_dir != nullptr) {
-    GetJsonValue(is_dir, root, "is_dir", false);
+    GetJsonValue(e.is_dir, root, "is_dir", false);
   }
-  if (!AssignString(path, m.path)) GetJsonValue(path, root, "path", true);
-  path_old.clear();
-  if (m.path_old != nullptr && !AssignString(path_old, m.path_old)) {
-    GetJsonValue(path_old, root, "path_old", false);
+  if (!AssignString(e.path, m.path)) GetJsonValue(e.path, root, "path", true);
+  e.path_old.clear();
+  if (m.path_old != nullptr && !AssignString(e.path_old, m.path_old)) {
+    GetJsonValue(e.path_old, root, "path_old", false);
   }
   // The parsed line is ours: its data moves rather than being copied.
   if (m.data != nullptr) {
-    data.swap(*m.data);
-  } else if (data.type() != Json::nullValue) {
-    data = Json::Value();
+    e.data.swap(*m.data);
+  } else if (e.data.type() != Json::nullValue) {
+    e.data = Json::Value();
   }
 }
+
+}  // namespace
+
+void Event::Assign(const std::string& event_raw) { AssignEvent(*this, event_raw); }
 
 OP::OP(std::shared_ptr<OPNode> node, FileIndexOP op, const std::string& path_old,
        const Json::Value& data)
@@ -243,16 +247,29 @@ OPTree::~OPTree() {
 }
 
 void OPTree::Clear() {
-  // Depth first, with an explicit stack: a node's operations go when the
-  // node is reached, and its children when the last of them is done, while
-  // they are still in the cache. A child dies there (unless a caller holds
-  // one of its operations), which only drops a reference to its parent: no
-  // destructor recurses down or up a long chain. Parent links stay, so an
-  // operation kept by a caller still knows its path.
   spare_op_.reset();
   ops.clear();
   last_node_ = nullptr;
   if (!root) return;
+  // Newest node first. Its own children are newer, so they are gone by now
+  // and it is the last child of its parent: dropping it there frees it while
+  // it is in the cache, and only drops a reference to its parent, so no
+  // destructor recurses down or up a long chain. A node that a caller still
+  // holds lives on with its parent link, so an operation kept by a caller
+  // still knows its path.
+  for (auto it = created_.rbegin(); it != created_.rend(); ++it) {
+    OPNode* node = *it;
+    node->ops.clear();
+    auto& siblings = node->parent->children;
+    if (node->children.empty() && !siblings.empty() && siblings.back().get() == node) {
+      siblings.pop_back();
+    }
+  }
+  created_.clear();
+  // Nodes made outside the tree (OPNode::GetChild), and the nodes above and
+  // before them, are still linked: depth first, with an explicit stack, for
+  // the same reason. Each node's children are dropped, so that no parent
+  // and child keep each other alive.
   struct Frame {
     OPNode* node;
     size_t next;  // the next child to descend into
@@ -264,9 +281,6 @@ void OPTree::Clear() {
     Frame& top = stack.back();
     const auto& children = top.node->children;
     if (top.next < children.size()) {
-      // Siblings lie apart in memory: the next ones are fetched early.
-      if (top.next + 2 < children.size()) __builtin_prefetch(children[top.next + 2].get());
-      if (top.next + 1 < children.size()) __builtin_prefetch(children[top.next + 1]->ops.data());
       OPNode* child = children[top.next++].get();
       child->ops.clear();
       stack.push_back({child, 0});
@@ -282,27 +296,26 @@ void OPTree::BuildTree() {
   LineReader reader;
   VELLIS_THROW_IF(!reader.Open(queue_path), kErrInternal,
                   std::string("Failed to open queue, reason=") + strerror(errno));
-  std::string_view line;
-  std::string raw;  // reused: one line at a time, no allocation per line
-  Event event;  // likewise
+  std::string_view line;  // the reader's own buffer: a line is not copied
+  Event event;             // reused: one line at a time
   for (;;) {
     LineReader::Status status = reader.Next(&line);
     if (status == LineReader::Status::kEnd) break;
     VELLIS_THROW_IF(status == LineReader::Status::kError, kErrInternal,
                     std::string("Failed to read queue, reason=") + strerror(errno));
-    raw.assign(line.data(), line.size());
     if (status == LineReader::Status::kTooLong) {
-      VELLIS_LOG_ERRNO("InsertEvent failed, event_raw=%s..., code=%d, reason=%s", raw.c_str(),
-                       static_cast<int>(kErrMalformedEvent), "line of 1 MiB or more skipped");
+      VELLIS_LOG_ERRNO("InsertEvent failed, event_raw=%s..., code=%d, reason=%s",
+                       std::string(line).c_str(), static_cast<int>(kErrMalformedEvent),
+                       "line of 1 MiB or more skipped");
       continue;
     }
-    VELLIS_LOG_DEBUG("Got event: %s", raw.c_str());
+    VELLIS_LOG_DEBUG("Got event: %s", std::string(line).c_str());
     try {
-      event.Assign(raw);
+      AssignEvent(event, line);
       Insert(event);
     } catch (const Error& e) {
-      VELLIS_LOG_ERRNO("InsertEvent failed, event_raw=%s, code=%d, reason=%s", raw.c_str(),
-                       static_cast<int>(e.GetCode()), e.what());
+      VELLIS_LOG_ERRNO("InsertEvent failed, event_raw=%s, code=%d, reason=%s",
+                       std::string(line).c_str(), static_cast<int>(e.GetCode()), e.what());
     }
     if (crashed) break;
   }
@@ -310,14 +323,22 @@ void OPTree::BuildTree() {
 
 OPNode* OPTree::NodeByPath(const std::string& path) {
   // Half the lines of a busy queue name the path of the line before (a new
-  // file is created, written and has its times set), and that path was
-  // checked when it was looked up.
+  // file is created, written and has its times set), and most of the rest
+  // name another file of its folder. Those parts were checked when the path
+  // before was looked up.
   if (last_node_ != nullptr && path == last_path_) return last_node_;
-  VELLIS_THROW_IF(!IsCanonicalPath(path), kErrNodeByPath, "GetNodeByPath failed, path=" + path);
   const size_t cut = path.rfind('/');
-  OPNode* parent = last_node_ != nullptr ? last_node_->parent.get() : nullptr;
-  if (parent == nullptr || cut != last_cut_ ||
-      path.compare(0, cut, last_path_, 0, cut) != 0) {
+  OPNode* parent = nullptr;
+  if (last_node_ != nullptr && cut == last_cut_ && path.size() <= kMaxPathBytes &&
+      path.compare(0, cut, last_path_, 0, cut) == 0) {
+    // Only the name is new: it is what follows the last slash, so it must
+    // not be empty, "." or "..".
+    const std::string_view name(path.data() + cut + 1, path.size() - cut - 1);
+    VELLIS_THROW_IF(name.empty() || name == "." || name == "..", kErrNodeByPath,
+                    "GetNodeByPath failed, path=" + path);
+    parent = last_node_->parent.get();
+  } else {
+    VELLIS_THROW_IF(!IsCanonicalPath(path), kErrNodeByPath, "GetNodeByPath failed, path=" + path);
     parent = root.get();
     for (size_t start = 1; start < cut;) {
       const size_t end = path.find('/', start);
@@ -337,8 +358,10 @@ std::shared_ptr<OPNode> OPTree::GetNodeByPath(const std::string& path) {
 
 OPNode* OPTree::ChildOf(OPNode* node, std::string_view name) {
   if (OPNode* child = node->FindChild(name)) return child;
-  return node->AppendChild(std::allocate_shared<OPNode>(
+  OPNode* child = node->AppendChild(std::allocate_shared<OPNode>(
       ArenaAllocator<OPNode>(arena_), node->shared_from_this(), std::string(name)));
+  created_.push_back(child);
+  return child;
 }
 
 void OPTree::TraverseNodeDescendant(std::shared_ptr<OPNode> node,

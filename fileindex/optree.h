@@ -15,6 +15,7 @@
 #include <json/json.h>
 
 #include <cstdint>
+#include <deque>
 #include <functional>
 #include <memory>
 #include <ostream>
@@ -208,6 +209,10 @@ class OPTree {
   // and the last operation a caller kept are gone.
   Arena* arena_;
   std::shared_ptr<OP> spare_op_;  // an operation no line attached; see NewOp
+  // Every node the tree made, in order of creation, which is their order in
+  // the arena: Clear frees them newest first, walking memory in order rather
+  // than hopping through the tree. Not owning.
+  std::deque<OPNode*> created_;
   // The node of the last path looked up, and that path: events come in
   // bursts on one file or in one folder, and this spares the walk down to
   // them. Nodes are not removed before Clear, which forgets it.

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <map>
+#include <set>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -266,9 +267,15 @@ TEST_F(OPTreeTest, GetNodeByPathRefusesPathsThatAreNotCanonical) {
 // between changes nothing.
 TEST_F(OPTreeTest, LookupFindsTheNodeOfThePathWhateverCameBefore) {
   OPTree tree(WriteQueue({}));
+  // A refused path right after a good one of the same folder must be
+  // refused as well, whatever it shares with it.
+  const std::string too_long = "/a/" + std::string(OPTree::kMaxPathBytes, 'n');
   const std::vector<std::string> sequence = {
-      "/a/b", "/a/b", "/a//b", "/a/b", "/a/bc", "/a/b/c", "/a",    "/x",  "/a/b", "/a/b/",
-      "/a/b", "/ab/b", "/a/c", "/b/c", "/a/c", "/a/b/c", "/a/b/.", "/a/b", "/x/y", "/x"};
+      "/a/b",  "/a/b", "/a//b", "/a/b",   "/a/bc", "/a/b/c", "/a",   "/x",     "/a/b",
+      "/a/b/", "/a/b", "/ab/b", "/a/c",   "/b/c",  "/a/c",   "/a/.", "/a/..",  too_long,
+      "/a/c",  "/a/",  "/a/b/c", "/a/b/.", "/a/b", "/x/y",   "/x"};
+  const std::set<std::string> refused = {"/a//b", "/a/b/", "/a/.", "/a/..",
+                                         too_long, "/a/",  "/a/b/."};
   std::map<std::string, std::shared_ptr<OPNode>> seen;
   for (const std::string& path : sequence) {
     std::shared_ptr<OPNode> node;
@@ -276,8 +283,10 @@ TEST_F(OPTreeTest, LookupFindsTheNodeOfThePathWhateverCameBefore) {
       node = tree.GetNodeByPath(path);
     } catch (const Error& e) {
       EXPECT_EQ(e.GetCode(), kErrNodeByPath) << path;
+      EXPECT_EQ(refused.count(path), 1u) << path << " was refused";
       continue;
     }
+    EXPECT_EQ(refused.count(path), 0u) << path.substr(0, 20) << " was accepted";
     EXPECT_EQ(node->GetPath(), path);
     auto [it, fresh] = seen.emplace(path, node);
     EXPECT_TRUE(fresh || it->second == node) << path << " resolved to a second node";
