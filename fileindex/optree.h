@@ -137,6 +137,8 @@ class OPTree {
  public:
   // Paths longer than this cannot name a file and are refused (9999).
   static constexpr size_t kMaxPathBytes = 4095;
+  // How many lines of the queue are read and parsed ahead of folding them.
+  static constexpr size_t kLinesReadAhead = 32;
 
   // Makes the tree (not crashed, empty root) and reads `queue_path` at once
   // (BuildTree); throws what BuildTree throws.

@@ -10,6 +10,7 @@
 
 #include "common/error.h"
 #include "common/json_util.h"
+#include "common/log.h"
 #include "tests/support/fake_platform.h"
 #include "tests/support/parse_json.h"
 #include "tests/support/temp_root.h"
@@ -201,6 +202,50 @@ TEST_F(OPTreeTest, CrashMarkerStopsReadingAndDeliversOnlyTheCrash) {
   EXPECT_EQ(count, 1u);
   EXPECT_EQ(platform_.LogsContaining("Queue crashed: " + queue_).size(), 1u);
   EXPECT_TRUE(platform_.LogsContaining("not json after the crash").empty());
+}
+
+// Lines are parsed ahead of folding, a batch at a time; the log must still
+// read as if each line were read, parsed and folded in turn, across batches.
+TEST_F(OPTreeTest, LogFollowsTheOrderOfTheLines) {
+  const size_t batch = OPTree::kLinesReadAhead;
+  const std::set<size_t> not_json = {0, batch - 1, batch + 3};
+  const std::set<size_t> bad_path = {1, batch, 2 * batch + 6};
+  std::vector<std::string> lines;
+  std::vector<std::string> expected_log, expected_ops;
+  for (size_t i = 0; i < 2 * batch + 7; ++i) {
+    const std::string mark = "#" + std::to_string(i) + "#";
+    expected_log.push_back("got " + mark);
+    if (not_json.count(i)) {
+      lines.push_back("not json " + mark);
+    } else if (bad_path.count(i)) {
+      lines.push_back(R"({"event":2,"path":"/s//)" + mark + R"("})");
+    } else {
+      lines.push_back(R"({"event":2,"path":"/s/)" + mark + R"("})");
+      expected_ops.push_back("[02] /s/" + mark);
+      continue;
+    }
+    expected_log.push_back("check failed " + mark);
+    expected_log.push_back("line skipped " + mark);
+  }
+  struct DebugLog {
+    DebugLog() { log_level = LOG_DEBUG; }
+    ~DebugLog() { log_level = LOG_INFO; }
+  } debug;
+  EXPECT_EQ(Fold(lines).delivered, expected_ops);
+  std::vector<std::string> log;
+  for (const auto& l : platform_.Logs()) {
+    const size_t at = l.text.find('#');
+    if (at == std::string::npos) continue;
+    const std::string mark = l.text.substr(at, l.text.find('#', at + 1) - at + 1);
+    if (l.text.find("Got event: ") != std::string::npos) {
+      log.push_back("got " + mark);
+    } else if (l.text.find(") Failed [") != std::string::npos) {
+      log.push_back("check failed " + mark);
+    } else if (l.text.find("InsertEvent failed") != std::string::npos) {
+      log.push_back("line skipped " + mark);
+    }
+  }
+  EXPECT_EQ(log, expected_log) << Join(log);
 }
 
 TEST_F(OPTreeTest, EmptyQueueDeliversNothing) {
