@@ -13,6 +13,8 @@
 namespace vellis::fileindex {
 namespace {
 
+constexpr size_t kReadAheadBytes = 64 * 1024;
+
 constexpr const char* kCategoryKeys[] = {"document", "audio", "video", "photo"};
 
 bool IsLive(const std::shared_ptr<OP>& e) {
@@ -330,7 +332,9 @@ void OPTree::BuildTree() {
     size_t n = 0;
     LineReader::Status status = LineReader::Status::kLine;
     int read_errno = 0;
-    while (n < ahead.size()) {
+    // A batch also ends after 64 KiB, so that lines near the length limit
+    // are held one or two at a time, not 32.
+    while (n < ahead.size() && text.size() < kReadAheadBytes) {
       std::string_view line;
       status = reader.Next(&line);
       if (status == LineReader::Status::kEnd) break;
