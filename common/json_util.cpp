@@ -62,6 +62,7 @@ bool JsonFromString(Json::Value& out, const std::string& text) {
 }
 
 bool JsonFromChars(Json::Value& out, std::string_view text) {
+  if (text.empty()) return false;  // no JSON text is empty; an empty view may hold no pointer
   // Valid JSON text holds no raw NUL; jsoncpp would let one through inside a
   // string, and jsoncpp does not check UTF-8 at all.
   if (memchr(text.data(), '\0', text.size()) != nullptr) return false;

@@ -112,9 +112,10 @@ bool AssignString(std::string& out, const Json::Value* v) {
 }
 
 // Fills `e` from `root`, the line `event_raw` as JsonFromChars left it
-// (`parsed` is what it returned); takes the line's data out of `root`.
-void ReadEvent(Event& e, bool parsed, Json::Value& root, std::string_view event_raw) {
-  VELLIS_THROW_IF(!parsed, kErrMalformedEvent, "Malformed event_raw: " + std::string(event_raw));
+// (`line_is_json` is what it returned); takes the line's data out of `root`.
+void ReadEvent(Event& e, bool line_is_json, Json::Value& root, std::string_view event_raw) {
+  VELLIS_THROW_IF(!line_is_json, kErrMalformedEvent,
+                  "Malformed event_raw: " + std::string(event_raw));
   // A member of its usual type is read in place; anything else (not an
   // object, a missing member, another type) goes to the JSON helper, which
   // converts, keeps the default or throws as it always does.
@@ -185,7 +186,13 @@ std::string OPNode::GetPath() const {
   return path;
 }
 
-OPNode::~OPNode() = default;
+OPNode::~OPNode() {
+  // Dropping the last reference to a deep node (an operation a caller kept
+  // after the tree is gone) frees its chain of parents: one at a time here,
+  // rather than each from the destructor of the one below.
+  std::shared_ptr<OPNode> up = std::move(parent);
+  while (up && up.use_count() == 1) up = std::move(up->parent);
+}
 
 // Up to this many children, a scan beats an index. Each child scanned is
 // likely a cache miss of its own, so the index takes over early.
@@ -254,6 +261,7 @@ void OPTree::Clear() {
   spare_op_.reset();
   ops.clear();
   last_node_ = nullptr;
+  last_folder_ = nullptr;
   if (!root) return;
   // Newest node first. Its own children are newer, so they are gone by now
   // and it is the last child of its parent: dropping it there frees it while
@@ -318,10 +326,13 @@ void OPTree::BuildTree() {
   // logs or throws happens while folding, so the log reads as if each line
   // were read, parsed and folded in turn, and nothing after a crash marker
   // is folded or logged.
+  // So is errno: what reading and parsing a line set is set again when it
+  // is folded, for the "[err: ...]" of its log lines.
   struct LineAhead {
     size_t offset, size;  // the line's text in `text`
     LineReader::Status status;
     bool parsed;  // whether `root` holds the parsed line
+    int read_errno;  // errno that reading and parsing the line set, or 0
     Json::Value root;
   };
   std::vector<LineAhead> ahead(kLinesReadAhead);
@@ -332,10 +343,12 @@ void OPTree::BuildTree() {
     size_t n = 0;
     LineReader::Status status = LineReader::Status::kLine;
     int read_errno = 0;
+    const int fold_errno = errno;
     // A batch also ends after 64 KiB, so that lines near the length limit
     // are held one or two at a time, not 32.
     while (n < ahead.size() && text.size() < kReadAheadBytes) {
       std::string_view line;
+      errno = 0;
       status = reader.Next(&line);
       if (status == LineReader::Status::kEnd) break;
       if (status == LineReader::Status::kError) {
@@ -349,10 +362,13 @@ void OPTree::BuildTree() {
       text.append(line);
       l.parsed = status == LineReader::Status::kLine &&
                  JsonFromChars(l.root, std::string_view(text.data() + l.offset, l.size));
+      l.read_errno = errno;
     }
+    errno = fold_errno;
     for (size_t i = 0; i < n; ++i) {
       LineAhead& l = ahead[i];
       const std::string_view raw(text.data() + l.offset, l.size);
+      if (l.read_errno != 0) errno = l.read_errno;
       if (l.status == LineReader::Status::kTooLong) {
         VELLIS_LOG_ERRNO("InsertEvent failed, event_raw=%s..., code=%d, reason=%s",
                          std::string(raw).c_str(), static_cast<int>(kErrMalformedEvent),
@@ -383,7 +399,7 @@ OPNode* OPTree::NodeByPath(const std::string& path) {
   // before was looked up.
   if (last_node_ != nullptr && path == last_path_) return last_node_;
   const size_t cut = path.rfind('/');
-  OPNode* parent = nullptr;
+  OPNode* parent = last_folder_;
   if (last_node_ != nullptr && cut == last_cut_ && path.size() <= kMaxPathBytes &&
       path.compare(0, cut, last_path_, 0, cut) == 0) {
     // Only the name is new: it is what follows the last slash, so it must
@@ -391,7 +407,6 @@ OPNode* OPTree::NodeByPath(const std::string& path) {
     const std::string_view name(path.data() + cut + 1, path.size() - cut - 1);
     VELLIS_THROW_IF(name.empty() || name == "." || name == "..", kErrNodeByPath,
                     "GetNodeByPath failed, path=" + path);
-    parent = last_node_->parent.get();
   } else {
     VELLIS_THROW_IF(!IsCanonicalPath(path), kErrNodeByPath, "GetNodeByPath failed, path=" + path);
     parent = root.get();
@@ -402,6 +417,7 @@ OPNode* OPTree::NodeByPath(const std::string& path) {
     }
   }
   last_node_ = ChildOf(parent, std::string_view(path.data() + cut + 1, path.size() - cut - 1));
+  last_folder_ = parent;
   last_path_ = path;
   last_cut_ = cut;
   return last_node_;

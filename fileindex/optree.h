@@ -118,6 +118,8 @@ struct OPNode : public std::enable_shared_from_this<OPNode> {
 
   std::string name;
   std::shared_ptr<OPNode> parent;
+  // Children may be appended, but never removed or replaced while the tree
+  // they belong to lives: the tree keeps plain pointers to its nodes.
   std::vector<std::shared_ptr<OPNode>> children;
   std::vector<std::shared_ptr<OP>> ops;
 
@@ -219,6 +221,7 @@ class OPTree {
   // bursts on one file or in one folder, and this spares the walk down to
   // them. Nodes are not removed before Clear, which forgets it.
   OPNode* last_node_ = nullptr;
+  OPNode* last_folder_ = nullptr;  // the node it was looked up in
   std::string last_path_;
   size_t last_cut_ = 0;  // where the folder part of last_path_ ends
 };

@@ -1,7 +1,9 @@
 #include "fileindex/optree.h"
 
 #include <gtest/gtest.h>
+#include <pthread.h>
 
+#include <cerrno>
 #include <map>
 #include <set>
 #include <sstream>
@@ -189,11 +191,11 @@ TEST_F(OPTreeTest, RefusedOldPathLeavesTheEarlierBitsOfTheLineAlone) {
 }
 
 TEST_F(OPTreeTest, CrashMarkerStopsReadingAndDeliversOnlyTheCrash) {
-  OPTree tree(WriteQueue({
-      R"({"event":2,"path":"/s/a"})",
-      R"({"event":512,"path":"/s/b"})",
-      "not json after the crash",
-  }));
+  // Enough bad lines after the marker to fill the batch it is read in and
+  // the next one: none of them is folded or logged.
+  std::vector<std::string> lines = {R"({"event":2,"path":"/s/a"})", R"({"event":512,"path":"/s/b"})"};
+  lines.resize(lines.size() + 2 * OPTree::kLinesReadAhead, "not json after the crash");
+  OPTree tree(WriteQueue(lines));
   std::vector<std::shared_ptr<OP>> got;
   unsigned count = tree.ProcessOP([&](std::shared_ptr<OP> op) { got.push_back(op); });
   ASSERT_EQ(got.size(), 1u);
@@ -210,11 +212,28 @@ TEST_F(OPTreeTest, LogFollowsTheOrderOfTheLines) {
   const size_t batch = OPTree::kLinesReadAhead;
   const std::set<size_t> not_json = {0, batch - 1, batch + 3};
   const std::set<size_t> bad_path = {1, batch, 2 * batch + 6};
+  // A number out of range: the parser sets errno, and only this line's
+  // check failure may carry it.
+  const size_t out_of_range = batch + 1;
+  // 1 MiB or more: skipped with its first bytes logged, and not parsed.
+  const size_t too_long = batch + 2;
   std::vector<std::string> lines;
   std::vector<std::string> expected_log, expected_ops;
   for (size_t i = 0; i < 2 * batch + 7; ++i) {
     const std::string mark = "#" + std::to_string(i) + "#";
+    if (i == too_long) {
+      lines.push_back(R"({"event":2,"path":"/s/)" + mark + R"(","data":")" +
+                      std::string(1u << 20, 'x') + R"("})");
+      expected_log.push_back("line skipped " + mark);
+      continue;
+    }
     expected_log.push_back("got " + mark);
+    if (i == out_of_range) {
+      lines.push_back(R"({"event":2,"path":"/s/)" + mark + R"(","data":1e400})");
+      expected_log.push_back("check failed " + mark + " err");
+      expected_log.push_back("line skipped " + mark);
+      continue;
+    }
     if (not_json.count(i)) {
       lines.push_back("not json " + mark);
     } else if (bad_path.count(i)) {
@@ -231,18 +250,24 @@ TEST_F(OPTreeTest, LogFollowsTheOrderOfTheLines) {
     DebugLog() { log_level = LOG_DEBUG; }
     ~DebugLog() { log_level = LOG_INFO; }
   } debug;
-  EXPECT_EQ(Fold(lines).delivered, expected_ops);
+  WriteQueue(lines);
+  errno = 0;  // whatever the caller left would show on the first line
+  OPTree tree(queue_);
+  std::vector<std::string> delivered;
+  tree.ProcessOP([&](std::shared_ptr<OP> op) { delivered.push_back(Print(op)); });
+  EXPECT_EQ(delivered, expected_ops);
   std::vector<std::string> log;
   for (const auto& l : platform_.Logs()) {
     const size_t at = l.text.find('#');
     if (at == std::string::npos) continue;
     const std::string mark = l.text.substr(at, l.text.find('#', at + 1) - at + 1);
+    const std::string err = l.text.find("[err: ") != std::string::npos ? " err" : "";
     if (l.text.find("Got event: ") != std::string::npos) {
-      log.push_back("got " + mark);
+      log.push_back("got " + mark + err);
     } else if (l.text.find(") Failed [") != std::string::npos) {
-      log.push_back("check failed " + mark);
+      log.push_back("check failed " + mark + err);
     } else if (l.text.find("InsertEvent failed") != std::string::npos) {
-      log.push_back("line skipped " + mark);
+      log.push_back("line skipped " + mark + err);
     }
   }
   EXPECT_EQ(log, expected_log) << Join(log);
@@ -412,6 +437,63 @@ TEST_F(OPTreeTest, DeliveredOperationsOutliveTheTree) {
   EXPECT_EQ(printed, (std::vector<std::string>{"[05] /v/s/a -> /v/s/b", "[02] /v/s/b/new.txt",
                                                R"([04] /v/s, data={"audio":true})"}))
       << Join(printed);
+}
+
+// Every node goes with the tree, however it was made: by the tree, with
+// GetChild, appended to `children` directly, or made by the tree below one
+// of those; none is kept alive by a parent and child holding each other.
+TEST_F(OPTreeTest, EveryNodeGoesWithTheTree) {
+  std::vector<std::weak_ptr<OPNode>> nodes;
+  {
+    OPTree tree(WriteQueue({R"({"event":2,"path":"/v/a/f"})", R"({"event":2,"path":"/v/b"})"}));
+    std::shared_ptr<OPNode> v = tree.GetNodeByPath("/v");
+    std::shared_ptr<OPNode> made = v->GetChild("made");
+    v->children.push_back(std::make_shared<OPNode>(v, "appended"));
+    tree.GetNodeByPath("/v/made/below");
+    tree.GetNodeByPath("/v/appended/below/deeper");
+    tree.GetNodeByPath("/v/c");  // made by the tree after the others
+    std::vector<std::shared_ptr<OPNode>> stack{tree.root};
+    while (!stack.empty()) {
+      std::shared_ptr<OPNode> n = stack.back();
+      stack.pop_back();
+      nodes.push_back(n);
+      for (const auto& c : n->children) stack.push_back(c);
+    }
+  }
+  ASSERT_EQ(nodes.size(), 11u);
+  for (const auto& n : nodes) EXPECT_TRUE(n.expired());
+}
+
+// Dropping the last reference to the bottom of a very deep chain of nodes,
+// after the tree is gone, frees the chain without one stack frame per level.
+TEST_F(OPTreeTest, DroppingAKeptNodeOfAVeryDeepChainDoesNotRecurse) {
+  std::shared_ptr<OPNode> bottom;
+  {
+    OPTree tree(WriteQueue({}));
+    bottom = tree.root;
+    for (int i = 0; i < 100000; ++i) bottom = bottom->GetChild("d");
+  }
+  std::weak_ptr<OPNode> top = [&] {
+    std::shared_ptr<OPNode> n = bottom;
+    while (n->parent) n = n->parent;
+    return n;
+  }();
+  // 256 KiB of stack: far less than 100,000 destructor frames take.
+  pthread_attr_t attr;
+  ASSERT_EQ(pthread_attr_init(&attr), 0);
+  ASSERT_EQ(pthread_attr_setstacksize(&attr, 256 * 1024), 0);
+  pthread_t thread;
+  ASSERT_EQ(pthread_create(
+                &thread, &attr,
+                [](void* p) -> void* {
+                  static_cast<std::shared_ptr<OPNode>*>(p)->reset();
+                  return nullptr;
+                },
+                &bottom),
+            0);
+  ASSERT_EQ(pthread_join(thread, nullptr), 0);
+  pthread_attr_destroy(&attr);
+  EXPECT_TRUE(top.expired());
 }
 
 TEST_F(OPTreeTest, ReindexOfAShallowFolderCancelsWorkOnAVeryDeepPath) {
