@@ -387,6 +387,17 @@ TEST_F(OPTreeTest, ChildMadeWithGetChildIsTheNodeOfItsPath) {
   EXPECT_EQ(tree.GetNodeByPath("/v/b/c")->parent, b);
   EXPECT_EQ(a->parent->children.size(), 2u);
   EXPECT_EQ(b->children.size(), 2u);
+  // A child appended with no parent, or with another one, is found in the
+  // folder it was appended to, and so are its siblings looked up next.
+  std::shared_ptr<OPNode> orphan = std::make_shared<OPNode>(nullptr, "orphan");
+  std::shared_ptr<OPNode> stray = std::make_shared<OPNode>(d, "stray");
+  b->children.push_back(orphan);
+  b->children.push_back(stray);
+  EXPECT_EQ(tree.GetNodeByPath("/v/b/orphan"), orphan);
+  EXPECT_EQ(tree.GetNodeByPath("/v/b/e")->parent, b);
+  EXPECT_EQ(tree.GetNodeByPath("/v/b/stray"), stray);
+  EXPECT_EQ(tree.GetNodeByPath("/v/b/f")->parent, b);
+  EXPECT_EQ(b->children.size(), 6u);
 }
 
 // A wide folder is searched through an index of its children: children
