@@ -274,16 +274,22 @@ void OPTree::Clear() {
     // the step before has had time to arrive: their parents and operation
     // lists, then their slots in the parents' lists and their operations.
     if (i >= 4) {
-      __builtin_prefetch(&created_[i - 4]->parent->children);
+      if (const OPNode* parent = created_[i - 4]->parent.get()) {
+        __builtin_prefetch(&parent->children);
+      }
       __builtin_prefetch(created_[i - 4]->ops.data());
     }
     if (i >= 2) {
       const OPNode* next = created_[i - 2];
-      if (!next->parent->children.empty()) __builtin_prefetch(&next->parent->children.back());
+      if (next->parent && !next->parent->children.empty()) {
+        __builtin_prefetch(&next->parent->children.back());
+      }
       if (!next->ops.empty()) __builtin_prefetch(next->ops.front().get());
     }
     OPNode* node = created_[i];
     node->ops.clear();
+    // A parent link a caller cleared leaves the node to the pass below.
+    if (node->parent == nullptr) continue;
     auto& siblings = node->parent->children;
     if (node->children.empty() && !siblings.empty() && siblings.back().get() == node) {
       siblings.pop_back();

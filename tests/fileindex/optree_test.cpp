@@ -452,7 +452,8 @@ TEST_F(OPTreeTest, DeliveredOperationsOutliveTheTree) {
 
 // Every node goes with the tree, however it was made: by the tree, with
 // GetChild, appended to `children` directly, or made by the tree below one
-// of those; none is kept alive by a parent and child holding each other.
+// of those, also when a caller cleared a node's parent link; none is kept
+// alive by a parent and child holding each other.
 TEST_F(OPTreeTest, EveryNodeGoesWithTheTree) {
   std::vector<std::weak_ptr<OPNode>> nodes;
   {
@@ -463,6 +464,7 @@ TEST_F(OPTreeTest, EveryNodeGoesWithTheTree) {
     tree.GetNodeByPath("/v/made/below");
     tree.GetNodeByPath("/v/appended/below/deeper");
     tree.GetNodeByPath("/v/c");  // made by the tree after the others
+    tree.GetNodeByPath("/v/cut/below")->parent->parent = nullptr;  // a link a caller cleared
     std::vector<std::shared_ptr<OPNode>> stack{tree.root};
     while (!stack.empty()) {
       std::shared_ptr<OPNode> n = stack.back();
@@ -471,7 +473,7 @@ TEST_F(OPTreeTest, EveryNodeGoesWithTheTree) {
       for (const auto& c : n->children) stack.push_back(c);
     }
   }
-  ASSERT_EQ(nodes.size(), 11u);
+  ASSERT_EQ(nodes.size(), 13u);
   for (const auto& n : nodes) EXPECT_TRUE(n.expired());
 }
 
