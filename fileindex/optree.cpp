@@ -1,5 +1,6 @@
 #include "fileindex/optree.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <functional>
@@ -22,24 +23,23 @@ bool IsLive(const std::shared_ptr<OP>& e) {
   return e->op != FILE_INDEX_OP_NONE && e->op != FILE_INDEX_OP_CRASH;
 }
 
+// A path component that names no entry of its own folder.
+bool IsRefusedName(std::string_view name) {
+  return name.empty() || name == "." || name == "..";
+}
+
 // The textual equivalent of "rebuilding the node's path gives the path back":
 // "/" followed by non-empty components separated by single slashes. "." and
 // ".." components are refused as well, so that no event names a path that
 // resolves elsewhere.
-bool IsCanonicalPath(const std::string& path) {
-  const size_t n = path.size();
-  if (n < 2 || n > OPTree::kMaxPathBytes || path[0] != '/' || path[n - 1] == '/') return false;
-  // One pass: each "/" starts a component, which must not be empty, "." or "..".
-  const char* p = path.data();
-  for (size_t i = 0; i < n; ++i) {
-    if (p[i] != '/') continue;
-    const char* c = p + i + 1;  // the component after this slash; the path does not end here
-    if (c[0] == '/') return false;
-    if (c[0] == '.' && (i + 2 == n || c[1] == '/' || (c[1] == '.' && (i + 3 == n || c[2] == '/')))) {
-      return false;
-    }
+bool IsCanonicalPath(std::string_view path) {
+  if (path.size() < 2 || path.size() > OPTree::kMaxPathBytes || path[0] != '/') return false;
+  for (size_t start = 1;;) {
+    const size_t end = std::min(path.find('/', start), path.size());
+    if (IsRefusedName(path.substr(start, end - start))) return false;
+    if (end == path.size()) return true;
+    start = end + 1;
   }
-  return true;
 }
 
 // Visits the operations pending on `node` when the visit starts, in
@@ -329,11 +329,10 @@ void OPTree::BuildTree() {
   // Lines are read and parsed a batch at a time, and then folded in order.
   // The parser and the tree each stay in the instruction cache for a whole
   // batch, where one line at a time they evict each other. Everything that
-  // logs or throws happens while folding, so the log reads as if each line
-  // were read, parsed and folded in turn, and nothing after a crash marker
+  // logs or throws happens while folding, with errno as reading and parsing
+  // that line left it, so the log (and its "[err: ...]") reads as if each
+  // line were read, parsed and folded in turn; nothing after a crash marker
   // is folded or logged.
-  // So is errno: what reading and parsing a line set is set again when it
-  // is folded, for the "[err: ...]" of its log lines.
   struct LineAhead {
     size_t offset, size;  // the line's text in `text`
     LineReader::Status status;
@@ -408,10 +407,8 @@ OPNode* OPTree::NodeByPath(const std::string& path) {
   OPNode* parent = last_folder_;
   if (last_node_ != nullptr && cut == last_cut_ && path.size() <= kMaxPathBytes &&
       path.compare(0, cut, last_path_, 0, cut) == 0) {
-    // Only the name is new: it is what follows the last slash, so it must
-    // not be empty, "." or "..".
-    const std::string_view name(path.data() + cut + 1, path.size() - cut - 1);
-    VELLIS_THROW_IF(name.empty() || name == "." || name == "..", kErrNodeByPath,
+    // Only the name, what follows the last slash, is new.
+    VELLIS_THROW_IF(IsRefusedName(std::string_view(path).substr(cut + 1)), kErrNodeByPath,
                     "GetNodeByPath failed, path=" + path);
   } else {
     VELLIS_THROW_IF(!IsCanonicalPath(path), kErrNodeByPath, "GetNodeByPath failed, path=" + path);
