@@ -29,12 +29,13 @@
 
 #include "common/json_util.h"
 #include "common/root_path.h"
-#include "tools/searchd/client.h"
-#include "tools/searchd/frame.h"
-#include "tools/searchd/handler.h"
-#include "tools/searchd/registry.h"
-#include "tools/searchd/server.h"
-#include "tools/searchd/sqlite_engine.h"
+#include "fileindex/elastic/comm.h"
+#include "fileindex/elastic/schema.h"
+#include "sdk/domain_socket.h"
+#include "daemons/searchd/handler.h"
+#include "daemons/searchd/registry.h"
+#include "daemons/searchd/server.h"
+#include "daemons/searchd/sqlite_engine.h"
 
 namespace {
 
@@ -114,39 +115,6 @@ Json::Value MakeDoc(int64_t i) {
   return d;
 }
 
-Json::Value Mappings() {
-  Json::Value m;
-  vellis::JsonFromString(m, R"({
-    "property_id": "QORUMDPath",
-    "default": {"type": "string", "analyzer": "qorustandard", "required": false,
-                "stored": true, "_all": true},
-    "properties": {
-      "QORUMDPath": {"analyzer": "keyword", "required": true, "_all": false},
-      "QORUMDFSName": {"analyzer": "keyword", "_all": false},
-      "QORUMDPrivilege": {"analyzer": "keyword", "_all": false},
-      "QORUMDIsDir": {"type": "bool", "_all": false},
-      "QORUMDOwnerUserID": {"analyzer": "keyword", "_all": false},
-      "QORUMDOwnerGroupID": {"analyzer": "keyword", "_all": false},
-      "QORUMDFSSize": {"type": "int"},
-      "QORUMDFSContentChangeDate": {"type": "int"},
-      "QORUMDAttributeChangeDate": {"type": "int"},
-      "QORUMDFSCreationDate": {"type": "int"},
-      "QORUMDAuthors": {"type": "text", "analyzer": "white space"},
-      "QORUMDTitle": {"type": "text"},
-      "QORUMDComment": {"type": "text"},
-      "QORUMDMediaTypes": {"analyzer": "keyword"},
-      "QORUMDParent": {"analyzer": "keyword", "_all": false},
-      "QORUMDExtension": {"analyzer": "keyword", "_all": false},
-      "QORUMDTextContent": {"type": "text"},
-      "QORUMDKeywords": {},
-      "QORUMDLogicalSize": {"type": "int"},
-      "QORUMDPhysicalSize": {"type": "int"},
-      "QORUMDSearchFileName": {"type": "text", "analyzer": "white space",
-                               "preprocess": ["tolower", "ngram"]}
-    }})");
-  return m;
-}
-
 Json::Value Request(const std::string& command, const Json::Value& data) {
   Json::Value r(Json::objectValue);
   r["command"] = command;
@@ -169,17 +137,17 @@ class Daemon {
     setenv(vellis::kRootEnv, TempDir().c_str(), 1);
     engine_ = std::make_unique<SqliteEngine>(vellis::RootPath(kRegistryPath));
     handler_ = std::make_unique<Handler>(*engine_);
-    socket_ = vellis::RootPath(kSocketPath);
+    socket_ = vellis::RootPath(vellis::kElasticSocketPath);
     mkdir((TempDir() + "/var").c_str(), 0755);
     mkdir((TempDir() + "/var/run").c_str(), 0755);
-    server_ = std::make_unique<Server>(*handler_, socket_);
+    server_ = MakeServer(*handler_, socket_, 2);
     server_->Listen();
     if (pipe(stop_) != 0) abort();
-    thread_ = std::thread([this] { server_->Run(stop_[0], 2); });
+    thread_ = std::thread([this] { server_->Run(stop_[0]); });
     Json::Value d(Json::objectValue);
     d["id"] = kIndex;
     d["path"] = TempDir() + "/db";
-    d["mappings"] = Mappings();
+    d["mappings"] = vellis::fileindex::elastic::GetFileIndexMappings();
     Call(Request("index_create", d));
   }
   ~Daemon() {
@@ -187,7 +155,7 @@ class Daemon {
     thread_.join();
   }
   Json::Value Call(const Json::Value& req) {
-    Json::Value answer = Exchange(socket_, req);
+    Json::Value answer = vellis::sdk::Exchange(socket_, req);
     if (!answer["success"].asBool() || answer["has_fail"].asBool()) {
       fprintf(stderr, "request failed: %s\n", vellis::JsonToString(answer).substr(0, 400).c_str());
       abort();
@@ -204,7 +172,7 @@ class Daemon {
  private:
   std::unique_ptr<SqliteEngine> engine_;
   std::unique_ptr<Handler> handler_;
-  std::unique_ptr<Server> server_;
+  std::unique_ptr<vellis::daemon::ServerLoop> server_;
   std::string socket_;
   int stop_[2];
   std::thread thread_;

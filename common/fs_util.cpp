@@ -10,9 +10,7 @@
 #include <cstdlib>
 
 #include "common/log.h"
-#include "common/mutex.h"
-#include "sdk/credentials.h"
-#include "sdk/platform.h"
+#include "common/host.h"
 
 namespace vellis {
 namespace {
@@ -28,10 +26,6 @@ bool IsDirExistDepth(const std::string& path, bool follow_link, int depth) {
   ssize_t n = readlink(path.c_str(), target, sizeof(target));
   if (n <= 0 || static_cast<size_t>(n) >= sizeof(target)) return false;
   return IsDirExistDepth(std::string(target, static_cast<size_t>(n)), true, depth + 1);
-}
-
-bool MVFileImpl(const std::string& from, const std::string& to, const sdk::CopyArgs& args) {
-  return sdk::GetPlatform()->QORUFileCopy(from, to, args) == 0;
 }
 
 }  // namespace
@@ -66,12 +60,12 @@ bool IsDirentDir(const dirent& entry, const std::string& /*path*/) {
 
 bool CheckACLPerm(const std::string& path, int perm) {
   int granted = 0;
-  if (sdk::GetPlatform()->QORUACLPermGet(path, &granted) < 0) return false;
+  if (GetHost()->AclPermGet(path, &granted) < 0) return false;
   return (granted & perm) != 0;
 }
 
 bool IsMountPoint(const std::string& path) {
-  return sdk::GetPlatform()->QORUFSDirIsMntPoint(path) > 0;
+  return GetHost()->DirIsMountPoint(path) > 0;
 }
 
 bool StringStartWith(const std::string& s, const std::string& prefix) {
@@ -121,26 +115,19 @@ std::string RealPath(const std::string& path) {
 bool Unlink(const std::string& path) { return unlink(path.c_str()) == 0 || errno == ENOENT; }
 
 bool MVFile(const std::string& from, const std::string& to) {
-  sdk::CopyArgs args;
-  args.overwrite = true;
-  args.remove_source = true;
-  return MVFileImpl(from, to, args);
+  return GetHost()->FileCopy(from, to, /*overwrite=*/true, /*remove_source=*/true) == 0;
 }
 
 bool CPFile(const std::string& from, const std::string& to) {
-  sdk::CopyArgs args;
-  args.overwrite = true;
-  return MVFileImpl(from, to, args);
+  return GetHost()->FileCopy(from, to, /*overwrite=*/true, /*remove_source=*/false) == 0;
 }
 
 bool ChownVellis(const std::string& path) {
-  sdk::UserInfo user;
-  {
-    LockMutex lock(sdk::SDKMutex());
-    VELLIS_THROW_IF(0 > sdk::GetPlatform()->QORUUserGet(kServiceUserName, &user), kErrServiceUser,
-                    std::string("QORUUserGet failed, user=") + kServiceUserName);
-  }
-  return chown(path.c_str(), user.uid, user.gid) == 0;
+  uint32_t uid = 0;
+  uint32_t gid = 0;
+  VELLIS_THROW_IF(0 > GetHost()->UserIds(kServiceUserName, &uid, &gid), kErrServiceUser,
+                  std::string("QORUUserGet failed, user=") + kServiceUserName);
+  return chown(path.c_str(), uid, gid) == 0;
 }
 
 }  // namespace vellis

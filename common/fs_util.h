@@ -29,7 +29,8 @@ bool IsDirExist(const std::string& path, bool follow_link);
 bool IsDirentDir(const dirent& entry, const std::string& path);
 
 // True when the platform grants the effective user any bit of `perm`
-// (sdk::AclPerm) on `path`; false when the platform cannot say.
+// (1 execute, 2 write, 4 read) on `path`; false when the platform cannot
+// say.
 bool CheckACLPerm(const std::string& path, int perm);
 
 // True when the platform says `path` is a mount point.

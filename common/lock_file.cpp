@@ -9,8 +9,8 @@
 #include <cstring>
 
 #include "common/fs_util.h"
+#include "common/host.h"
 #include "common/log.h"
-#include "sdk/platform.h"
 
 namespace vellis {
 LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(path) {
@@ -23,7 +23,7 @@ LockFile::LockFile(const std::string& path, bool exclusive) : fd_(-1), path_(pat
     close(fd_);  // a half-made lock object must not leak its descriptor
     fd_ = -1;
     if (err != EINTR && err != EWOULDBLOCK) throw Error(kErrLock, strerror(err));
-    sdk::GetPlatform()->USleep(static_cast<uint64_t>(sdk::GetPlatform()->Rand() % 10) * 100000);
+    GetHost()->USleep(static_cast<uint64_t>(GetHost()->Rand() % 10) * 100000);
     if (--budget == 0) throw Error(kErrLock, "Exceed max retry, path=" + path_);
   }
 }

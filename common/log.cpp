@@ -7,7 +7,7 @@
 #include <cstring>
 #include <vector>
 
-#include "sdk/platform.h"
+#include "common/host.h"
 
 namespace vellis {
 
@@ -63,7 +63,7 @@ const char* SourceName(const char* file) {
 
 void ThrowCheckFailure(int saved_errno, const char* file, int line, const char* func,
                        const char* condition, ErrorCode code, const std::string& reason) {
-  sdk::GetPlatform()->Syslog(LOG_ERR, ProcessPrefix(file, line, func) + "Failed [" + condition +
+  GetHost()->Syslog(LOG_ERR, ProcessPrefix(file, line, func) + "Failed [" + condition +
                                           "], reason: " + reason + ErrnoSuffix(saved_errno));
   errno = 0;
   throw Error(code, reason);
@@ -72,13 +72,13 @@ void ThrowCheckFailure(int saved_errno, const char* file, int line, const char* 
 void LogWithErrno(int priority, const char* file, int line, const char* func,
                   const std::string& text) {
   int err = errno;
-  sdk::GetPlatform()->Syslog(priority, ProcessPrefix(file, line, func) + text + ErrnoSuffix(err));
+  GetHost()->Syslog(priority, ProcessPrefix(file, line, func) + text + ErrnoSuffix(err));
   errno = 0;
 }
 
 void LogPlain(int priority, const char* file, int line, const std::string& text) {
   int err = errno;  // logging must not disturb the caller's errno
-  sdk::GetPlatform()->Syslog(priority, StringPrintf("%s:%d ", SourceName(file), line) + text);
+  GetHost()->Syslog(priority, StringPrintf("%s:%d ", SourceName(file), line) + text);
   errno = err;
 }
 

@@ -1,7 +1,7 @@
 // Log lines and the failure-check convention.
 //
-// Every line goes to the system log through the platform seam
-// (sdk::GetPlatform()->Syslog), so tests can read them. Source names are the
+// Every line goes to the system log through the host (common/host.h), which
+// the platform layer forwards to its seam, so tests can read them. Source names are the
 // basename of the real file; pid and euid are the calling process's.
 //
 // VELLIS_THROW_IF(failed, code, reason): when `failed` is true, writes

@@ -1,4 +1,4 @@
-#include "fileindex/custom_event.h"
+#include "fileindex/util.h"
 
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -13,7 +13,6 @@
 #include "common/log.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
-#include "fileindex/util.h"
 #include "sdk/share.h"
 
 namespace vellis::fileindex {

@@ -8,7 +8,6 @@
 #include "common/lock_file.h"
 #include "common/log.h"
 #include "common/root_path.h"
-#include "fileindex/custom_event.h"
 #include "fileindex/elastic/communication.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/index_mgr.h"

@@ -8,7 +8,7 @@
 #include "common/lock_file.h"
 #include "common/log.h"
 #include "common/root_path.h"
-#include "fileindex/custom_event.h"
+#include "fileindex/util.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/optree.h"
 #include "fileindex/status_mgr.h"

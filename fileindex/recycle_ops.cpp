@@ -5,7 +5,7 @@
 
 #include "common/fs_util.h"
 #include "common/log.h"
-#include "fileindex/custom_event.h"
+#include "fileindex/util.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/optree.h"
 #include "sdk/platform.h"

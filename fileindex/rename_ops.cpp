@@ -4,7 +4,6 @@
 #include <string>
 
 #include "common/log.h"
-#include "fileindex/custom_event.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/optree.h"

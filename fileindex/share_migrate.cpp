@@ -3,7 +3,7 @@
 #include <string>
 
 #include "common/log.h"
-#include "fileindex/custom_event.h"
+#include "fileindex/util.h"
 #include "fileindex/elastic/communication.h"
 #include "fileindex/elastic/elastic_control.h"
 #include "fileindex/index_mgr.h"

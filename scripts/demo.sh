@@ -9,9 +9,9 @@
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/setup.sh build
-VELLIS=build/tools/vellis/vellis
+VELLIS=build/bin/vellis
 
-SEARCHD=build/tools/searchd/vellis-searchd
+SEARCHD=build/bin/vellis-searchd
 
 export VELLIS_ROOT="$(mktemp -d /tmp/vellis-demo-XXXXXX)"
 cleanup() {

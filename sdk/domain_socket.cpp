@@ -1,6 +1,5 @@
 #include "sdk/domain_socket.h"
 
-#include <poll.h>
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <sys/un.h>
@@ -8,42 +7,14 @@
 
 #include <cerrno>
 #include <cstring>
-#include <ctime>
 
+#include "common/error.h"
+#include "common/json_util.h"
 #include "common/log.h"
 #include "sdk/frame.h"
+#include "sdk/socket_io.h"
 
 namespace vellis::sdk {
-namespace {
-
-// Small messages go out in one system call; larger ones are not copied.
-constexpr size_t kCoalesceLimit = 64 * 1024;
-
-long long NowMs() {
-  timespec ts;
-  clock_gettime(CLOCK_MONOTONIC, &ts);
-  return static_cast<long long>(ts.tv_sec) * 1000 + ts.tv_nsec / 1000000;
-}
-
-// Waits until `fd` is ready for `events` or the deadline passes. True when
-// ready (or in error, which the following call then reports).
-bool WaitReady(int fd, short events, long long deadline_ms) {
-  for (;;) {
-    long long left = deadline_ms - NowMs();
-    if (left <= 0) return false;
-    pollfd p{fd, events, 0};
-    int rc = poll(&p, 1, static_cast<int>(left > 1000000 ? 1000000 : left));
-    if (rc > 0) return true;
-    if (rc < 0 && errno != EINTR) return true;  // let the caller see the error
-  }
-}
-
-std::string ErrnoText(int err) {
-  char buf[256];
-  return strerror_r(err, buf, sizeof(buf));
-}
-
-}  // namespace
 
 SockConnection::~SockConnection() { Disconnect(); }
 
@@ -65,89 +36,42 @@ bool SockConnection::Fail(const std::string& why) {
   return false;
 }
 
-bool SockConnection::SendAll(const char* data, size_t size, long long deadline_ms) {
-  size_t done = 0;
-  while (done < size) {
-    ssize_t n = send(fd_, data + done, size - done, MSG_NOSIGNAL | MSG_DONTWAIT);
-    if (n > 0) {
-      done += static_cast<size_t>(n);
-      continue;
-    }
-    if (n < 0 && errno == EINTR) continue;
-    if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
-      if (!WaitReady(fd_, POLLOUT, deadline_ms)) {
-        return Fail("send timed out after " + std::to_string(send_timeout_ms_) + " ms, " +
-                    std::to_string(done) + " of " + std::to_string(size) + " bytes sent");
-      }
-      continue;
-    }
-    return Fail("send failed: " + ErrnoText(errno));
-  }
-  return true;
-}
-
-bool SockConnection::RecvAll(char* data, size_t size, long long deadline_ms) {
-  size_t done = 0;
-  while (done < size) {
-    ssize_t n = recv(fd_, data + done, size - done, MSG_DONTWAIT);
-    if (n > 0) {
-      done += static_cast<size_t>(n);
-      continue;
-    }
-    if (n == 0) {
-      return Fail("peer closed the connection after " + std::to_string(done) + " of " +
-                  std::to_string(size) + " bytes");
-    }
-    if (errno == EINTR) continue;
-    if (errno == EAGAIN || errno == EWOULDBLOCK) {
-      if (!WaitReady(fd_, POLLIN, deadline_ms)) {
-        return Fail("receive timed out after " + std::to_string(recv_timeout_ms_) + " ms, " +
-                    std::to_string(done) + " of " + std::to_string(size) + " bytes received");
-      }
-      continue;
-    }
-    return Fail("recv failed: " + ErrnoText(errno));
-  }
-  return true;
-}
-
 bool SockConnection::Send(const std::string& message) {
   if (fd_ == -1) return false;
-  long long deadline = NowMs() + send_timeout_ms_;
-  std::string error;
-  if (message.size() <= kCoalesceLimit) {
-    std::string frame;
-    if (!EncodeFrame(message, &frame, &error)) return Fail("send refused: " + error);
-    if (!SendAll(frame.data(), frame.size(), deadline)) return false;
-  } else {
-    if (message.size() > kMaxMessageSize) {
-      std::string ignored;
-      EncodeFrame(message, &ignored, &error);  // only for the explanation
-      return Fail("send refused: " + error);
-    }
-    std::string header = EncodeFrameHeader(static_cast<uint32_t>(message.size()));
-    if (!SendAll(header.data(), header.size(), deadline)) return false;
-    if (!SendAll(message.data(), message.size(), deadline)) return false;
+  IoResult r = WriteFrame(fd_, message, DeadlineAfter(send_timeout_ms_));
+  if (r.status == IoStatus::kBadLength) {
+    return Fail("send refused: message length " + std::to_string(message.size()) +
+                " is 0 or above the maximum of " + std::to_string(kMaxMessageSize) + " bytes");
   }
+  if (r.status == IoStatus::kTimeout) {
+    return Fail("send timed out after " + std::to_string(send_timeout_ms_) + " ms, " +
+                std::to_string(r.done) + " bytes sent");
+  }
+  if (r.status != IoStatus::kOk) return Fail("send failed: " + IoResultText(r));
   errno = 0;  // EAGAIN of the non-blocking attempts is not news to callers
   return true;
 }
 
 bool SockConnection::Recv(std::string& message) {
   if (fd_ == -1) return false;
-  long long deadline = NowMs() + recv_timeout_ms_;
-  unsigned char header[kFrameHeaderSize];
-  if (!RecvAll(reinterpret_cast<char*>(header), sizeof(header), deadline)) return false;
-  uint32_t length = 0;
-  std::string error;
-  if (!DecodeFrameHeader(header, &length, &error)) return Fail("receive refused: " + error);
-  message.resize(length);
-  if (!RecvAll(&message[0], length, deadline)) {
-    message.clear();
-    return false;
+  std::string why;
+  IoResult r = ReadFrame(fd_, &message, DeadlineAfter(recv_timeout_ms_), &why);
+  switch (r.status) {
+    case IoStatus::kOk:
+      errno = 0;
+      return true;
+    case IoStatus::kBadLength:
+      return Fail("receive refused: " + why);
+    case IoStatus::kTimeout:
+      return Fail("receive timed out after " + std::to_string(recv_timeout_ms_) + " ms, " +
+                  std::to_string(r.done) + " bytes received");
+    case IoStatus::kClosed:
+    case IoStatus::kTruncated:
+      return Fail("peer closed the connection after " + std::to_string(r.done) + " bytes");
+    case IoStatus::kError:
+      break;
   }
-  errno = 0;
-  return true;
+  return Fail("recv failed: " + IoResultText(r));
 }
 
 bool DomainSockConnection::Connect() {
@@ -166,16 +90,12 @@ bool DomainSockConnection::Connect() {
   // whose accept queue is full (transfers use their own deadlines).
   const int ms = send_timeout_ms();
   timeval tv{ms / 1000, (ms % 1000) * 1000};
-  if (setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &tv, sizeof(tv)) != 0) {
-    int saved = errno;
-    close(fd);
-    errno = saved;
-    return false;
+  int rc = setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &tv, sizeof(tv));
+  if (rc == 0) {
+    do {
+      rc = connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof(addr));
+    } while (rc != 0 && errno == EINTR);
   }
-  int rc;
-  do {
-    rc = connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof(addr));
-  } while (rc != 0 && errno == EINTR);
   if (rc != 0) {
     int saved = errno;
     close(fd);
@@ -184,6 +104,29 @@ bool DomainSockConnection::Connect() {
   }
   fd_ = fd;
   return true;
+}
+
+std::string ExchangeText(const std::string& socket_path, const std::string& request,
+                         int timeout_ms) {
+  DomainSockConnection conn(socket_path);
+  conn.SetTimeouts(kDefaultSendTimeoutMs, timeout_ms);
+  if (!conn.Connect()) {
+    throw Error(kErrDaemonUnreachable,
+                "Connect failed: " + socket_path + ": " + std::string(strerror(errno)));
+  }
+  if (!conn.Send(request)) throw Error(kErrDaemonUnreachable, "Send failed: " + socket_path);
+  std::string answer;
+  if (!conn.Recv(answer)) throw Error(kErrDaemonUnreachable, "Recv failed: " + socket_path);
+  return answer;
+}
+
+Json::Value Exchange(const std::string& socket_path, const Json::Value& request, int timeout_ms) {
+  std::string text = ExchangeText(socket_path, JsonToString(request), timeout_ms);
+  Json::Value answer;
+  if (!JsonFromString(answer, text) || !answer.isObject() || !answer["success"].isBool()) {
+    throw Error(kErrDaemonUnreachable, "Recv failed, res=" + text);
+  }
+  return answer;
 }
 
 }  // namespace vellis::sdk

@@ -1,7 +1,9 @@
-// Connections to the package's daemons over Unix-domain stream sockets.
+// Connections to the package's daemons over Unix-domain stream sockets: the
+// client side of the package's one wire.
 //
 // One message each way is a frame of sdk/frame.h: a 4-byte length in host
-// byte order, then the JSON text. Send and Recv move one whole message. Every
+// byte order, then the JSON text. Send and Recv move one whole message
+// (sdk/socket_io.h). Every
 // transfer has a deadline, so a peer that stops reading or writing (or that
 // trickles one byte at a time) cannot hang the caller: the call fails when
 // the whole message has not moved within the time-out.
@@ -12,6 +14,8 @@
 //
 // A connection is used by one thread at a time.
 #pragma once
+
+#include <json/json.h>
 
 #include <string>
 
@@ -63,10 +67,6 @@ class SockConnection {
   int fd_ = -1;
 
  private:
-  // Moves exactly `size` bytes before the deadline (milliseconds of the
-  // monotonic clock).
-  bool SendAll(const char* data, size_t size, long long deadline_ms);
-  bool RecvAll(char* data, size_t size, long long deadline_ms);
   // Logs why the connection failed and closes it; returns false.
   bool Fail(const std::string& why);
 
@@ -88,5 +88,18 @@ class DomainSockConnection : public SockConnection {
  private:
   std::string path_;
 };
+
+// One request, one answer: connects to the socket at `socket_path`, sends
+// `request` as one frame, reads one frame back (waiting at most
+// `timeout_ms`) and closes. Returns the answer's text. Throws Error 913
+// (kErrDaemonUnreachable) with a reason naming the step and the socket when
+// the connection, the send or the receive fails. Thread-safe.
+std::string ExchangeText(const std::string& socket_path, const std::string& request,
+                         int timeout_ms = 60 * 1000);
+
+// ExchangeText on JSON: `request` serialised, the answer parsed. Throws
+// Error 913 also when the answer is not a JSON object with a bool "success".
+Json::Value Exchange(const std::string& socket_path, const Json::Value& request,
+                     int timeout_ms = 60 * 1000);
 
 }  // namespace vellis::sdk

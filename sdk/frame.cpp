@@ -1,5 +1,6 @@
 #include "sdk/frame.h"
 
+#include <algorithm>
 #include <cstring>
 
 namespace vellis::sdk {
@@ -38,6 +39,29 @@ bool EncodeFrame(const std::string& payload, std::string* frame, std::string* er
   *frame = EncodeFrameHeader(static_cast<uint32_t>(payload.size()));
   frame->append(payload);
   return true;
+}
+
+}  // namespace vellis::sdk
+
+namespace vellis::sdk {
+
+size_t FrameReader::Feed(const char* data, size_t size) {
+  if (state_ != State::kNeedMore) return 0;
+  size_t taken = 0;
+  if (received_ < kFrameHeaderSize) {
+    while (taken < size && received_ < kFrameHeaderSize) header_[received_++] = data[taken++];
+    if (received_ < kFrameHeaderSize) return taken;
+    if (!DecodeFrameHeader(header_, &length_, &error_)) {
+      state_ = State::kBadLength;
+      return taken;
+    }
+  }
+  const size_t want = std::min<size_t>(size - taken, length_ - message_.size());
+  message_.append(data + taken, want);
+  taken += want;
+  received_ += want;
+  if (message_.size() == length_) state_ = State::kComplete;
+  return taken;
 }
 
 }  // namespace vellis::sdk

@@ -1,10 +1,11 @@
 // The byte framing of one message on the package's Unix-domain sockets.
 //
 // A message is a 4-byte unsigned length in host byte order followed by
-// exactly that many bytes of JSON text, without a terminating zero. The
-// search daemon's socket and the indexing daemon's command socket use the
-// same framing. These functions are pure (bytes in, values out) and
-// thread-safe.
+// exactly that many bytes of JSON text, without a terminating zero. Every
+// socket of the package (the search daemon's, the indexing daemon's command
+// socket, and those of the daemons to come) uses this framing. Everything
+// here is pure (bytes in, values out) and thread-safe for distinct objects;
+// sdk/socket_io.h moves frames over descriptors.
 #pragma once
 
 #include <cstddef>
@@ -32,5 +33,45 @@ bool DecodeFrameHeader(const unsigned char* header, uint32_t* length, std::strin
 // Header followed by `payload`. Returns false with *error filled when the
 // payload is empty or longer than kMaxMessageSize; *frame is then untouched.
 bool EncodeFrame(const std::string& payload, std::string* frame, std::string* error);
+
+// Assembles one message from bytes as they arrive, in pieces of any size:
+// the receiving side of a non-blocking server. The buffer grows only with
+// bytes actually received, so a peer that announces a large message and
+// sends little costs no memory.
+class FrameReader {
+ public:
+  enum class State {
+    kNeedMore,   // the message is not complete yet
+    kComplete,   // message() holds the whole text
+    kBadLength,  // the announced length is 0 or above kMaxMessageSize
+  };
+
+  // Takes bytes from `data` up to the end of the message and returns how
+  // many it took; bytes after the message are not taken. Takes nothing once
+  // the state is kComplete or kBadLength.
+  size_t Feed(const char* data, size_t size);
+
+  State state() const { return state_; }
+  // Whether any byte has arrived.
+  bool started() const { return received_ > 0; }
+  // Bytes taken so far, the header included.
+  size_t received() const { return received_; }
+  // The announced length, once the header is complete (else 0); also when
+  // it was refused.
+  uint32_t length() const { return length_; }
+  // The message text, whole once kComplete.
+  const std::string& message() const { return message_; }
+  std::string TakeMessage() { return std::move(message_); }
+  // Why the length was refused (kBadLength).
+  const std::string& error() const { return error_; }
+
+ private:
+  State state_ = State::kNeedMore;
+  unsigned char header_[kFrameHeaderSize] = {};
+  size_t received_ = 0;
+  uint32_t length_ = 0;
+  std::string message_;
+  std::string error_;
+};
 
 }  // namespace vellis::sdk

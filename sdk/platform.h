@@ -241,7 +241,7 @@ class Platform {
   // --- Content extraction ---
   // Fills *doc (replacing it) with the document of the file or directory at
   // the full path `path`: an object keyed by the metadata field names of
-  // fileindex/elastic/schema.h (docs/document.md lists which). `options`
+  // sdk/metadata_fields.h (docs/document.md lists which). `options`
   // member "need_meta" (bool) asks for content metadata as well as the
   // file-system fields. A symbolic link is described as itself, never
   // followed. 0 on success, negative when the path cannot be examined

@@ -4,7 +4,6 @@
 #include <sys/un.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <atomic>
 #include <cerrno>
 #include <cstring>
@@ -15,6 +14,7 @@
 #include "common/root_path.h"
 #include "sdk/frame.h"
 #include "sdk/platform.h"
+#include "sdk/socket_io.h"
 
 namespace vellis::fileindex {
 namespace {
@@ -56,31 +56,24 @@ CommandTimeouts TEST_SetCommandTimeouts(CommandTimeouts timeouts) {
 }
 
 void BufferWrite(int fd, unsigned int length, const unsigned char* buffer) {
-  unsigned int done = 0;
-  while (done < length) {
-    const size_t piece = std::min(length - done, kPieceSize);
-    ssize_t n = send(fd, buffer + done, piece, MSG_NOSIGNAL);
-    if (n < 0 && errno == ENOTSOCK) n = write(fd, buffer + done, piece);
-    if (n < 1) {
-      if (errno == EINTR) continue;
-      if (n == 0) errno = EIO;
-      VELLIS_THROW_IF(n < 1, kErrInternal, "write failed, reason=" + ErrnoText(errno));
-    }
-    done += static_cast<unsigned int>(n);
-  }
+  sdk::IoLimits limits;
+  limits.piece = kPieceSize;
+  sdk::IoResult r = sdk::WriteExact(fd, buffer, length, limits);
+  errno = r.error;
+  VELLIS_THROW_IF(r.status != sdk::IoStatus::kOk, kErrInternal,
+                  "write failed, reason=" + ErrnoText(r.error));
 }
 
 void BufferRead(int fd, unsigned int length, unsigned char* buffer) {
-  unsigned int done = 0;
-  while (done < length) {
-    ssize_t n = read(fd, buffer + done, std::min(length - done, kPieceSize));
-    if (n < 0 && errno == EINTR) continue;
-    // End of stream before the whole message is a failure too, or this loop
-    // would never end.
-    VELLIS_THROW_IF(n == 0, kErrInternal, "read failed, reason=end of stream");
-    VELLIS_THROW_IF(n < 0, kErrInternal, "read failed, reason=" + ErrnoText(errno));
-    done += static_cast<unsigned int>(n);
-  }
+  sdk::IoLimits limits;
+  limits.piece = kPieceSize;
+  sdk::IoResult r = sdk::ReadExact(fd, buffer, length, limits);
+  // End of stream before the whole message is a failure too.
+  VELLIS_THROW_IF(r.status == sdk::IoStatus::kClosed || r.status == sdk::IoStatus::kTruncated,
+                  kErrInternal, "read failed, reason=end of stream");
+  errno = r.error;
+  VELLIS_THROW_IF(r.status != sdk::IoStatus::kOk, kErrInternal,
+                  "read failed, reason=" + ErrnoText(r.error));
 }
 
 std::string SendCommandToDaemon(const std::string& type, const Json::Value& data) {

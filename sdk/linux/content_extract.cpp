@@ -12,13 +12,13 @@
 
 #include "common/fs_util.h"
 #include "common/log.h"
-#include "fileindex/elastic/schema.h"
 #include "sdk/linux/linux_platform.h"
+#include "sdk/metadata_fields.h"
 
 namespace vellis::sdk {
 namespace {
 
-namespace fe = vellis::fileindex::elastic;
+namespace fe = vellis::sdk::metadata;
 
 // Opens `path` without resolving any symbolic link on the way, so that a link
 // inside a share can never lead the indexer out of it. A link as the last

@@ -1,6 +1,6 @@
 // Custom events: the line written into the share's queue, failures turned
 // into the share's need-reindex bit, and appenders racing the rotation.
-#include "fileindex/custom_event.h"
+#include "fileindex/util.h"
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>

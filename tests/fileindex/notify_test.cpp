@@ -25,11 +25,11 @@ const char kLink[] = "<a data-qoru-app=\"QORU.Vellis.Application\" data-qoru-fn=
 // The built vellis-notify: beside `vellis`, two folders up from this test.
 std::string NotifierPath() {
   const char* dir = getenv("VELLIS_TEST_BINARY_DIR");
-  if (dir && *dir) return std::string(dir) + "/tools/vellis/vellis-notify";
+  if (dir && *dir) return std::string(dir) + "/bin/vellis-notify";
   char buf[4096];
   ssize_t n = readlink("/proc/self/exe", buf, sizeof(buf) - 1);
   std::string exe(buf, n > 0 ? static_cast<size_t>(n) : 0);
-  return Dirname(Dirname(exe)) + "/tools/vellis/vellis-notify";
+  return Dirname(Dirname(exe)) + "/bin/vellis-notify";
 }
 
 class NotifyTest : public ::testing::Test {

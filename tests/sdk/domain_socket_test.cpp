@@ -74,8 +74,8 @@ TEST_F(SockConnectionTest, FailedReceiveClosesTheConnectionAndSaysWhy) {
       {EncodeFrameHeader(kMaxMessageSize + 1), false, "above the maximum"},
       {EncodeFrameHeader(0xFFFFFFFFu), false, "above the maximum"},
       {EncodeFrameHeader(100) + "{\"success\":", true,
-       "peer closed the connection after 11 of 100 bytes"},
-      {"", false, "receive timed out after 100 ms, 0 of 4 bytes"},
+       "peer closed the connection after 15 bytes"},
+      {"", false, "receive timed out after 100 ms, 0 bytes received"},
   };
   for (const auto& c : cases) {
     SetUp();

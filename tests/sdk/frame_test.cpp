@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstring>
 
 namespace vellis::sdk {
@@ -54,6 +55,44 @@ TEST(FrameTest, EncodesPayloadAfterHeaderAndRefusesEmptyOne) {
 
   ASSERT_TRUE(EncodeFrame("{\"a\":1}", &frame, &error)) << error;
   EXPECT_EQ(frame, EncodeFrameHeader(7) + "{\"a\":1}");
+}
+
+// Bytes arrive in pieces of every size; the message comes out whole, and
+// bytes after it are left for the caller.
+TEST(FrameReaderTest, AssemblesAMessageFromPiecesOfAnySize) {
+  const std::string text = "{\"command\":\"index_list\"}";
+  const std::string bytes = EncodeFrameHeader(static_cast<uint32_t>(text.size())) + text + "NEXT";
+  for (size_t piece : {size_t{1}, size_t{3}, size_t{4}, size_t{5}, bytes.size()}) {
+    FrameReader reader;
+    size_t fed = 0;
+    while (fed < bytes.size() && reader.state() == FrameReader::State::kNeedMore) {
+      const size_t n = std::min(piece, bytes.size() - fed);
+      fed += reader.Feed(bytes.data() + fed, n);
+    }
+    ASSERT_EQ(reader.state(), FrameReader::State::kComplete) << piece;
+    EXPECT_EQ(reader.message(), text) << piece;
+    EXPECT_EQ(bytes.substr(fed), "NEXT") << "bytes after the message are not taken: " << piece;
+    EXPECT_EQ(reader.Feed("x", 1), 0u) << piece;
+  }
+}
+
+TEST(FrameReaderTest, RefusesBadLengthsWithoutAllocatingThem) {
+  for (uint32_t length : {0u, kMaxMessageSize + 1, 0xFFFFFFFFu, __builtin_bswap32(100u)}) {
+    FrameReader reader;
+    const std::string bytes = EncodeFrameHeader(length) + "{}";
+    EXPECT_EQ(reader.Feed(bytes.data(), bytes.size()), kFrameHeaderSize) << length;
+    EXPECT_EQ(reader.state(), FrameReader::State::kBadLength) << length;
+    EXPECT_FALSE(reader.error().empty()) << length;
+    EXPECT_EQ(reader.length(), length);
+  }
+  // A large length that is allowed: memory grows with what arrives.
+  FrameReader reader;
+  const std::string bytes = EncodeFrameHeader(kMaxMessageSize) + "{\"a\"";
+  reader.Feed(bytes.data(), bytes.size());
+  EXPECT_EQ(reader.state(), FrameReader::State::kNeedMore);
+  EXPECT_TRUE(reader.started());
+  EXPECT_EQ(reader.received(), bytes.size());
+  EXPECT_LT(reader.message().capacity(), 4096u);
 }
 
 }  // namespace

@@ -9,7 +9,7 @@ namespace vellis::testing {
 
 CliRun Vellis(const std::string& args) {
   const char* dir = getenv("VELLIS_TEST_BINARY_DIR");
-  std::string bin = std::string(dir ? dir : ".") + "/tools/vellis/vellis";
+  std::string bin = std::string(dir ? dir : ".") + "/bin/vellis";
   FILE* p = popen((bin + " " + args + " 2>&1").c_str(), "r");
   CliRun r{-1, ""};
   if (!p) return r;

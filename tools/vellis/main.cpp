@@ -42,5 +42,5 @@ int main(int argc, char** argv) {
     std::cerr << "error: " << e.what() << "\n";
     return 1;
   }
-  return 0;
+  return ctx.exit_status;
 }

@@ -3,6 +3,7 @@
 #include <memory>
 #include <string>
 
+#include "common/json_util.h"
 #include "fileindex/util.h"
 #include "tools/vellis/commands.h"
 
@@ -32,13 +33,27 @@ void AddPathCommands(CLI::App& app, Context& ctx) {
   CLI::App* group = app.add_subcommand("path", "Ask the indexing rules about a path");
   group->require_subcommand(1);
 
+  auto json = std::make_shared<bool>(false);
   CLI::App* check = group->add_subcommand(
-      "check", "Tell whether FULL_PATH may be indexed, and if not, which rule refuses it");
+      "check",
+      "Tell whether FULL_PATH may be indexed, and if not, which rule refuses it; exit status 0 "
+      "when it may, 1 when not");
   check->add_option("FULL_PATH", *path, "Full path (/volume1/photo/a.jpg)")->required();
-  check->callback([&ctx, path] {
-    ctx.action = [path] {
+  check->add_flag("--json", *json,
+                  "Print {\"path\", \"indexable\", \"rule\"} (rule: the refusing rule, or "
+                  "\"indexable\")");
+  check->callback([&ctx, path, json] {
+    ctx.action = [&ctx, path, json] {
       fileindex::IndexRule rule = fileindex::CheckFullPathIndexable(*path);
-      if (rule == fileindex::IndexRule::kIndexable) {
+      const bool indexable = rule == fileindex::IndexRule::kIndexable;
+      ctx.exit_status = indexable ? 0 : 1;
+      if (*json) {
+        Json::Value out(Json::objectValue);
+        out["path"] = *path;
+        out["indexable"] = indexable;
+        out["rule"] = fileindex::IndexRuleName(rule);
+        std::cout << JsonToString(out) << "\n";
+      } else if (indexable) {
         std::cout << "indexable\n";
       } else {
         std::cout << "not indexable: " << fileindex::IndexRuleName(rule) << "\n";

@@ -6,8 +6,8 @@
 #include "common/error.h"
 #include "common/json_util.h"
 #include "common/root_path.h"
-#include "tools/searchd/client.h"
-#include "tools/searchd/frame.h"
+#include "fileindex/elastic/comm.h"
+#include "sdk/domain_socket.h"
 #include "tools/vellis/commands.h"
 
 namespace vellis::cli {
@@ -28,7 +28,7 @@ Json::Value Ask(const std::string& command, const Json::Value& data) {
   Json::Value req(Json::objectValue);
   req["command"] = command;
   req["data"] = data;
-  Json::Value answer = searchd::Exchange(RootPath(searchd::kSocketPath), req);
+  Json::Value answer = sdk::Exchange(RootPath(kElasticSocketPath), req);
   if (!answer["success"].asBool()) {
     throw Error(static_cast<ErrorCode>(answer["error"]["code"].asInt()),
                 answer["error"]["msg"].asString());

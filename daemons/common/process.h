@@ -1,0 +1,41 @@
+// Process chores shared by every daemon: detaching, the pid file and the
+// descriptor limit.
+#pragma once
+
+#include <string>
+
+namespace vellis::daemon {
+
+// The pid file of the program `name`: "/var/run/<name>.pid"; resolve with
+// RootPath() at use.
+std::string PidFilePath(const std::string& name);
+
+// Detaches from the terminal: forks (the parent exits 0), starts a new
+// session, changes to "/" and points stdin, stdout and stderr at /dev/null.
+// Throws Error kErrInternal when fork or setsid fails. Call before starting
+// threads or opening databases.
+void Daemonize();
+
+// Holds the pid file, locked, for the object's lifetime: one daemon per
+// root. The file holds the pid and a newline; it is removed on destruction.
+class PidFile {
+ public:
+  // Creates the file's folder when missing. Throws Error kErrLock when
+  // another live daemon holds the file, kErrInternal when it cannot be
+  // written.
+  explicit PidFile(std::string path);
+  ~PidFile();
+  PidFile(const PidFile&) = delete;
+  PidFile& operator=(const PidFile&) = delete;
+
+ private:
+  std::string path_;
+  int fd_ = -1;
+};
+
+// Raises the soft limit on open descriptors to the hard limit, so that a
+// server can hold thousands of connections. Returns the soft limit now in
+// force.
+unsigned long RaiseDescriptorLimit();
+
+}  // namespace vellis::daemon
