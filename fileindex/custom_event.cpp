@@ -1,5 +1,3 @@
-#include "fileindex/util.h"
-
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -13,6 +11,7 @@
 #include "common/log.h"
 #include "fileindex/queue_mgr.h"
 #include "fileindex/status_mgr.h"
+#include "fileindex/util.h"
 #include "sdk/share.h"
 
 namespace vellis::fileindex {

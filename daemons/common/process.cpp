@@ -15,7 +15,6 @@ namespace vellis::daemon {
 
 std::string PidFilePath(const std::string& name) { return "/var/run/" + name + ".pid"; }
 
-
 void Daemonize() {
   pid_t pid = fork();
   if (pid < 0) throw Error(kErrInternal, std::string("fork: ") + strerror(errno));

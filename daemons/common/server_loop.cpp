@@ -145,9 +145,9 @@ bool ServerLoop::MakeRoom() {
     ++stats_.evicted;
     if (now - last_eviction_log_ >= kRefusalLogEveryMs) {
       last_eviction_log_ = now;
-      Log(LOG_WARNING, "closed the oldest idle connection: " +
-                           std::to_string(options_.max_connections) +
-                           " connections open, the maximum");
+      Log(LOG_WARNING,
+          "closed the oldest idle connection: " + std::to_string(options_.max_connections) +
+              " connections open, the maximum");
     }
     return true;
   }
@@ -353,8 +353,8 @@ void ServerLoop::ExpireDeadlines() {
                            " of " + std::to_string(c.out.size()) + " bytes in " +
                            std::to_string(options_.answer_timeout_ms) + " ms");
     } else if (c.reader.started()) {
-      Log(LOG_WARNING, "request dropped: " + std::to_string(c.reader.received()) +
-                           " bytes in " + std::to_string(options_.request_timeout_ms) +
+      Log(LOG_WARNING, "request dropped: " + std::to_string(c.reader.received()) + " bytes in " +
+                           std::to_string(options_.request_timeout_ms) +
                            " ms, not a whole message");
     } else {
       ++idle_dropped;
@@ -362,8 +362,7 @@ void ServerLoop::ExpireDeadlines() {
     Close(id);
   }
   if (idle_dropped > 0) {
-    Log(LOG_INFO, "closed " + std::to_string(idle_dropped) +
-                      " connections that sent nothing in " +
+    Log(LOG_INFO, "closed " + std::to_string(idle_dropped) + " connections that sent nothing in " +
                       std::to_string(options_.request_timeout_ms) + " ms");
   }
 }
@@ -391,7 +390,8 @@ void ServerLoop::MaybeRunUpkeep() {
 void ServerLoop::Step(int timeout_ms) {
   int64_t wait = std::max(timeout_ms, 0);
   const int64_t now = Now();
-  if (!deadlines_.empty()) wait = std::min(wait, std::max<int64_t>(deadlines_.begin()->first - now, 0));
+  if (!deadlines_.empty())
+    wait = std::min(wait, std::max<int64_t>(deadlines_.begin()->first - now, 0));
   if (upkeep_ && options_.idle_after_ms > 0 && !upkeep_running_ && working_ == 0) {
     const int64_t due = upkeep_more_ ? now : UpkeepDue();
     wait = std::min(wait, std::max<int64_t>(due - now, 0));

@@ -77,8 +77,8 @@ class ServerLoop {
   using Clock = std::function<int64_t()>;
 
   struct Stats {
-    size_t open = 0;     // connections open now
-    size_t idle = 0;     // of those, the ones that have sent nothing yet
+    size_t open = 0;  // connections open now
+    size_t idle = 0;  // of those, the ones that have sent nothing yet
     uint64_t accepted = 0;
     uint64_t answered = 0;
     uint64_t refused = 0;    // over the cap with nothing to evict

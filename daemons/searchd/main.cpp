@@ -44,8 +44,7 @@ int Serve(int workers, int recv_timeout_ms) {
   if (stop_fd < 0) throw vellis::Error(vellis::kErrInternal, "signalfd failed");
 
   vellis::daemon::RaiseDescriptorLimit();
-  vellis::daemon::PidFile pid_file(
-      vellis::RootPath(vellis::daemon::PidFilePath("vellis-searchd")));
+  vellis::daemon::PidFile pid_file(vellis::RootPath(vellis::daemon::PidFilePath("vellis-searchd")));
   SqliteEngine engine(vellis::RootPath(kRegistryPath));
   Handler handler(engine);
   const std::string socket = vellis::RootPath(vellis::kElasticSocketPath);
@@ -74,7 +73,8 @@ int main(int argc, char** argv) {
   bool foreground = false;
   int workers = kDefaultWorkers;
   app.add_flag("-f,--foreground", foreground, "Stay attached to the terminal (default: detach)");
-  app.add_option("--workers", workers, "Worker threads running requests (requests run one at a time)")
+  app.add_option("--workers", workers,
+                 "Worker threads running requests (requests run one at a time)")
       ->check(CLI::Range(1, 64));
   int recv_timeout_ms = vellis::searchd::kRecvTimeoutMs;
   app.add_option("--recv-timeout-ms", recv_timeout_ms,

@@ -18,10 +18,10 @@
 #include "sdk/domain_socket.h"
 #include "sdk/frame.h"
 #include "sdk/socket_io.h"
-#include "tests/support/cli_runner.h"
-#include "tests/support/temp_root.h"
 #include "tests/daemons/searchd/daemon_process.h"
 #include "tests/daemons/searchd/searchd_fixture.h"
+#include "tests/support/cli_runner.h"
+#include "tests/support/temp_root.h"
 
 namespace vellis::searchd::testing {
 namespace {
@@ -170,7 +170,8 @@ TEST_F(DaemonTest, TermStopsCleanlyAndKeepsPendingWrites) {
   Ok(UpsertRequest(kIndex, FileDoc("/v/s/pending.txt")));
   EXPECT_EQ(Stop(SIGTERM), 0);
   EXPECT_NE(access(socket_.c_str(), F_OK), 0) << "socket file removed";
-  EXPECT_NE(access(RootPath(daemon::PidFilePath("vellis-searchd")).c_str(), F_OK), 0) << "pid file removed";
+  EXPECT_NE(access(RootPath(daemon::PidFilePath("vellis-searchd")).c_str(), F_OK), 0)
+      << "pid file removed";
   Start();
   EXPECT_EQ(DocumentCount(), 1);
 }
@@ -235,13 +236,15 @@ TEST_F(DaemonTest, VellisSearchPrintsHitsWithSnippets) {
             "    The [budget] plan for next year\n"
             "1 hit (1 shown)\n");
 
-  ::vellis::testing::CliRun json = ::vellis::testing::Vellis("search budget --json --index " + std::string(kIndex));
+  ::vellis::testing::CliRun json =
+      ::vellis::testing::Vellis("search budget --json --index " + std::string(kIndex));
   EXPECT_EQ(json.status, 0) << json.out;
   Json::Value answers = Parse(json.out);
   ASSERT_EQ(answers.size(), 1u) << json.out;
   EXPECT_EQ(answers[0]["total"].asInt(), 2);
 
-  ::vellis::testing::CliRun unknown = ::vellis::testing::Vellis("search budget --index fileindex_none");
+  ::vellis::testing::CliRun unknown =
+      ::vellis::testing::Vellis("search budget --index fileindex_none");
   EXPECT_EQ(unknown.status, 1);
   EXPECT_NE(unknown.out.find("error 1104: No index fileindex_none"), std::string::npos)
       << unknown.out;

@@ -10,11 +10,11 @@
 
 #include "common/json_util.h"
 #include "common/root_path.h"
-#include "tests/support/fake_platform.h"
-#include "tests/support/temp_root.h"
-#include "tests/daemons/searchd/searchd_fixture.h"
 #include "daemons/searchd/registry.h"
 #include "daemons/searchd/sqlite_engine.h"
+#include "tests/daemons/searchd/searchd_fixture.h"
+#include "tests/support/fake_platform.h"
+#include "tests/support/temp_root.h"
 
 namespace vellis::searchd::testing {
 namespace {

@@ -16,14 +16,13 @@
 #include "common/root_path.h"
 #include "daemons/common/process.h"
 #include "fileindex/elastic/comm.h"
+#include "fileindex/elastic/elastic_control.h"
 #include "sdk/domain_socket.h"
 #include "sdk/socket_io.h"
-#include "fileindex/elastic/comm.h"
-#include "fileindex/elastic/elastic_control.h"
-#include "tests/support/fake_share_platform.h"
-#include "tests/support/temp_root.h"
 #include "tests/daemons/searchd/daemon_process.h"
 #include "tests/daemons/searchd/searchd_fixture.h"
+#include "tests/support/fake_share_platform.h"
+#include "tests/support/temp_root.h"
 
 namespace vellis::searchd::testing {
 namespace {
@@ -121,8 +120,8 @@ TEST_F(LibraryClientTest, ShareLifecycleRequests) {
   elastic::ShareIndexRename("music", "music2", root_.Path("/volume2/@fileindex/music2/db"));
   EXPECT_EQ(Search("fileindex_music2", "kept")["total"].asInt(), 1);
   elastic::ShareIndexDelete("music2");
-  Json::Value list =
-      sdk::Exchange(RootPath(kElasticSocketPath), Request("index_list", Json::Value(Json::objectValue)));
+  Json::Value list = sdk::Exchange(RootPath(kElasticSocketPath),
+                                   Request("index_list", Json::Value(Json::objectValue)));
   EXPECT_EQ(list["data"].size(), 0u) << JsonToString(list);
 }
 
