@@ -6,9 +6,11 @@
 #include <unistd.h>
 
 #include <cstring>
+#include <functional>
 #include <memory>
 #include <thread>
 
+#include "common/error.h"
 #include "common/root_path.h"
 #include "sdk/frame.h"
 #include "tests/support/fake_platform.h"
@@ -33,6 +35,7 @@ class SockConnectionTest : public ::testing::Test {
   }
   void TearDown() override {
     if (peer_ >= 0) close(peer_);
+    peer_ = -1;
   }
   void PeerWrite(const std::string& bytes) {
     ASSERT_EQ(write(peer_, bytes.data(), bytes.size()), static_cast<ssize_t>(bytes.size()));
@@ -48,22 +51,6 @@ class SockConnectionTest : public ::testing::Test {
   int peer_ = -1;
 };
 
-TEST_F(SockConnectionTest, MovesWholeMessagesOfAnySize) {
-  for (size_t size : {size_t{1}, size_t{100}, size_t{70000}, size_t{3} << 20}) {
-    std::string message(size, 'x');
-    message.front() = '{';
-    message.back() = '}';
-    conn_->SetTimeouts(5000, 5000);
-    SockConnection peer(dup(peer_));
-    peer.SetTimeouts(5000, 5000);
-    std::string received;
-    std::thread reader([&] { EXPECT_TRUE(peer.Recv(received)) << size; });
-    EXPECT_TRUE(conn_->Send(message)) << size;
-    reader.join();
-    EXPECT_EQ(received, message) << size;
-  }
-}
-
 TEST_F(SockConnectionTest, FailedReceiveClosesTheConnectionAndSaysWhy) {
   struct Case {
     std::string from_peer;
@@ -73,11 +60,11 @@ TEST_F(SockConnectionTest, FailedReceiveClosesTheConnectionAndSaysWhy) {
       {EncodeFrameHeader(0), false, "receive refused: announced message length is 0"},
       {EncodeFrameHeader(kMaxMessageSize + 1), false, "above the maximum"},
       {EncodeFrameHeader(0xFFFFFFFFu), false, "above the maximum"},
-      {EncodeFrameHeader(100) + "{\"success\":", true,
-       "peer closed the connection after 15 bytes"},
+      {EncodeFrameHeader(100) + "{\"success\":", true, "peer closed the connection after 15 bytes"},
       {"", false, "receive timed out after 100 ms, 0 bytes received"},
   };
   for (const auto& c : cases) {
+    TearDown();
     SetUp();
     PeerWrite(c.from_peer);
     if (c.close_peer) ClosePeer();
@@ -87,23 +74,23 @@ TEST_F(SockConnectionTest, FailedReceiveClosesTheConnectionAndSaysWhy) {
     EXPECT_LT(message.capacity(), 4096u) << "nothing allocated: " << c.logged;
     EXPECT_EQ(platform_.LogsContaining(c.logged).size(), 1u) << c.logged;
     platform_.ClearLogs();
-    TearDown();
   }
 }
 
-TEST_F(SockConnectionTest, PeerThatNeverReadsTimesOutTheSend) {
-  std::string big(8u << 20, 'x');
-  EXPECT_FALSE(conn_->Send(big));
+TEST_F(SockConnectionTest, FailedSendClosesTheConnectionWithoutSignal) {
+  EXPECT_FALSE(conn_->Send(std::string(8u << 20, 'x'))) << "a peer that never reads";
   EXPECT_EQ(conn_->fd(), -1);
   EXPECT_EQ(platform_.LogsContaining("send timed out after 100 ms").size(), 1u);
-}
-
-TEST_F(SockConnectionTest, SendToAGonePeerFailsWithoutSignal) {
+  TearDown();
+  SetUp();
   ClosePeer();
   EXPECT_FALSE(conn_->Send("{}"));  // SIGPIPE would end the test binary here
-  EXPECT_EQ(conn_->fd(), -1);
+  EXPECT_EQ(platform_.LogsContaining("send failed: Broken pipe").size(), 1u);
   EXPECT_FALSE(conn_->Send("{}")) << "a closed connection stays closed";
+  TearDown();
+  SetUp();
   EXPECT_FALSE(conn_->Send("")) << "an empty message is refused";
+  EXPECT_EQ(platform_.LogsContaining("send refused: message length 0").size(), 1u);
 }
 
 TEST(DomainSockConnectionTest, ConnectsOnlyWhereADaemonListens) {
@@ -132,6 +119,32 @@ TEST(DomainSockConnectionTest, ConnectsOnlyWhereADaemonListens) {
   EXPECT_EQ(conn.fd(), -1);
   ASSERT_EQ(daemon.RawRequests().size(), 1u);
   EXPECT_EQ(daemon.RawRequests()[0], "{\"question\":1}");
+}
+
+TEST(ExchangeTest, OneRequestOneAnswerOrError913NamingTheStep) {
+  FakePlatform platform;
+  ScopedPlatform scoped(&platform);
+  testing::TempRoot root;
+  const std::string path = root.Path("/var/run/x.sock");
+  auto code_and_reason = [&](const std::function<void()>& call) -> std::string {
+    try {
+      call();
+    } catch (const Error& e) {
+      return std::to_string(e.GetCode()) + " " + e.what();
+    }
+    return "no error";
+  };
+  EXPECT_EQ(code_and_reason([&] {
+              Exchange(path, Json::Value());
+            }).rfind("913 Connect failed: " + path, 0),
+            0u);
+  FakeSearchDaemon daemon(path);
+  daemon.Push(FakeSearchDaemon::Raw("{\"success\":true,\"data\":7}"));
+  EXPECT_EQ(Exchange(path, Json::Value(Json::objectValue))["data"].asInt(), 7);
+  daemon.Push(FakeSearchDaemon::Raw("[1]"));
+  EXPECT_EQ(code_and_reason([&] { Exchange(path, Json::Value()); }), "913 Recv failed, res=[1]");
+  daemon.Push(FakeSearchDaemon::CloseEarly());
+  EXPECT_EQ(code_and_reason([&] { ExchangeText(path, "{}"); }), "913 Recv failed: " + path);
 }
 
 TEST(DomainSockConnectionTest, DaemonThatNeverAcceptsIsNotWaitedForForever) {
