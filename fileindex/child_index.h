@@ -15,8 +15,9 @@ struct OPNode;
 // that a lookup touches the index once before the child it finds. A slot
 // holds a child pointer tagged in its top 16 bits with bits of the name's
 // hash, so a probe rarely visits a child that does not match. The index
-// does not own the children.
-class ChildIndex {
+// does not own the children. A slot is 64 bits wide on every target: a
+// 32-bit pointer has no unused bits, so there it sits in the low half.
+class alignas(8) ChildIndex {
  public:
   static uint32_t Hash(std::string_view name);
 
@@ -40,9 +41,10 @@ class ChildIndex {
  private:
   explicit ChildIndex(uint32_t capacity) : capacity_(capacity) {}
   static std::unique_ptr<ChildIndex> Make(uint32_t capacity);
-  static uintptr_t Tag(uint32_t hash);
-  uintptr_t* slots() { return reinterpret_cast<uintptr_t*>(this + 1); }
-  const uintptr_t* slots() const { return reinterpret_cast<const uintptr_t*>(this + 1); }
+  using Slot = uint64_t;
+  static Slot Tag(uint32_t hash);
+  Slot* slots() { return reinterpret_cast<Slot*>(this + 1); }
+  const Slot* slots() const { return reinterpret_cast<const Slot*>(this + 1); }
   // Places a child known to be absent, in an index with room for it.
   void Place(OPNode* child, uint32_t hash);
 

@@ -2,11 +2,23 @@
 # Installs every package that the build, the tests and the demo need on a
 # Debian 12 machine (idempotent), then configures and builds in build/.
 #   scripts/setup.sh [BUILD_DIR] [extra cmake arguments...]
+# With -DCMAKE_TOOLCHAIN_FILE=cmake/i386.cmake among the arguments, the
+# 32-bit x86 packages (Debian multiarch) are installed as well.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
 PACKAGES=(build-essential cmake pkg-config libjsoncpp-dev libcli11-dev libgtest-dev
-          libgmock-dev libbenchmark-dev libsqlite3-dev libunistring-dev)
+          libgmock-dev libbenchmark-dev libsqlite3-dev libunistring-dev util-linux)
+if [[ " $* " == *"cmake/i386.cmake"* ]]; then
+  # The search daemon links the i386 SQLite runtime (cmake/i386.cmake says why).
+  PACKAGES+=(g++-multilib libjsoncpp-dev:i386 libunistring-dev:i386 libgtest-dev:i386
+             libgmock-dev:i386 libsqlite3-0:i386)
+  if ! dpkg --print-foreign-architectures | grep -qx i386; then
+    SUDO=""
+    [ "$(id -u)" -eq 0 ] || SUDO="sudo"
+    $SUDO dpkg --add-architecture i386
+  fi
+fi
 
 missing=()
 for p in "${PACKAGES[@]}"; do

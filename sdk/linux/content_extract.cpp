@@ -26,7 +26,10 @@ namespace fe = vellis::sdk::metadata;
 int OpenNoSymlinks(const std::string& path, int flags) {
   open_how how;
   memset(&how, 0, sizeof(how));
-  how.flags = static_cast<uint64_t>(flags | O_CLOEXEC | O_NOFOLLOW);
+  // The raw call gets no O_LARGEFILE from the C library: a 32-bit process
+  // asks for it itself (the kernel refuses it together with O_PATH).
+  const int large = (flags & O_PATH) ? 0 : O_LARGEFILE;
+  how.flags = static_cast<uint64_t>(flags | O_CLOEXEC | O_NOFOLLOW | large);
   how.resolve = RESOLVE_NO_SYMLINKS;
   long fd = syscall(SYS_openat2, AT_FDCWD, path.c_str(), &how, sizeof(how));
   if (fd < 0 && errno == ENOSYS) {
