@@ -143,7 +143,7 @@ TEST(ExchangeTest, OneRequestOneAnswerOrError913NamingTheStep) {
   EXPECT_EQ(Exchange(path, Json::Value(Json::objectValue))["data"].asInt(), 7);
   daemon.Push(FakeSearchDaemon::Raw("[1]"));
   EXPECT_EQ(code_and_reason([&] { Exchange(path, Json::Value()); }), "913 Recv failed, res=[1]");
-  daemon.Push(FakeSearchDaemon::CloseEarly());
+  daemon.Push({"", /*close=*/true});
   EXPECT_EQ(code_and_reason([&] { ExchangeText(path, "{}"); }), "913 Recv failed: " + path);
 }
 

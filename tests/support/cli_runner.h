@@ -1,17 +1,21 @@
-// Runs the built `vellis` command line as a user runs it.
+// Runs the `vellis` of this build ($VELLIS_TEST_BINARY_DIR/bin) as a user runs it.
 #pragma once
 
 #include <string>
+#include <vector>
 
 namespace vellis::testing {
 
-struct CliRun {
-  int status;       // exit status; -1 when it did not exit normally
-  std::string out;  // stdout and stderr together
+// One run: `args` are shell words quoted by the caller; `out` is what it
+// prints on stdout and stderr together, "..." standing for any text.
+struct CliCase {
+  std::string args;
+  int status;
+  std::string out;
 };
 
-// The `vellis` of this build (found through $VELLIS_TEST_BINARY_DIR, which
-// ctest sets) with `args`: shell words, quoted by the caller.
-CliRun Vellis(const std::string& args);
+// Runs each case in order and expects its exit status and output. A failure
+// names the arguments and shows what the run printed.
+void ExpectRuns(const std::vector<CliCase>& cases);
 
 }  // namespace vellis::testing

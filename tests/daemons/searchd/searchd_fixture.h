@@ -1,11 +1,10 @@
-// Shared pieces of the search daemon's tests: request builders and
-// documents. Indexes are created with the library's own mappings, so the
-// tests exercise the schema that production uses.
+// Requests of the search daemon's tests, written as JSON text. Indexes use
+// the library's own mappings, as production does.
 #pragma once
 
-#include <json/json.h>
-
+#include <stdexcept>
 #include <string>
+#include <vector>
 
 #include "common/json_util.h"
 #include "fileindex/elastic/schema.h"
@@ -18,51 +17,56 @@ inline Json::Value Parse(const std::string& text) {
   return v;
 }
 
-inline Json::Value Request(const std::string& command, const Json::Value& data) {
+// {"command": command, "data": data}, `data` JSON text; index `id` unless it names one.
+inline Json::Value Request(const std::string& command, const std::string& data = "{}",
+                           const std::string& id = "s") {
   Json::Value r(Json::objectValue);
   r["command"] = command;
-  r["data"] = data;
+  r["data"] = Parse(data);
+  if (!r["data"].isMember("id")) r["data"]["id"] = id;
   return r;
 }
 
 inline Json::Value CreateRequest(const std::string& id, const std::string& path) {
-  Json::Value d(Json::objectValue);
-  d["id"] = id;
-  d["path"] = path;
-  d["settings"] = fileindex::elastic::GetFileIndexSettings();
-  d["mappings"] = fileindex::elastic::GetFileIndexMappings();
-  d["event_handler"] = fileindex::elastic::GetFileIndexEventHandler();
-  return Request("index_create", d);
+  Json::Value r = Request("index_create", "{}", id);
+  r["data"]["path"] = path;
+  r["data"]["mappings"] = fileindex::elastic::GetFileIndexMappings();
+  return r;
 }
 
-// A file's document as the indexer sends it: path, name fields, size, date.
-inline Json::Value FileDoc(const std::string& path, int64_t size = 100, int64_t mtime = 1000) {
-  Json::Value d(Json::objectValue);
-  std::string name = path.substr(path.rfind('/') + 1);
-  d["QORUMDPath"] = path;
-  d["QORUMDFSName"] = name;
-  d["QORUMDSearchFileName"] = name;
-  d["QORUMDParent"] = path.substr(0, path.rfind('/'));
-  size_t dot = name.rfind('.');
-  if (dot != std::string::npos) d["QORUMDExtension"] = name.substr(dot + 1);
-  d["QORUMDFSSize"] = static_cast<Json::Int64>(size);
-  d["QORUMDFSContentChangeDate"] = static_cast<Json::Int64>(mtime);
-  d["QORUMDIsDir"] = false;
-  return d;
+// The upsert of a file's document as the indexer sends it (path, name
+// fields, size 100, date 1000), with the members of `extra` (JSON text).
+inline Json::Value Upsert(const std::string& path, const std::string& extra = "{}",
+                          const std::string& id = "s") {
+  const std::string name = path.substr(path.rfind('/') + 1);
+  Json::Value r = Request("document_upsert_by_id", R"({"data": )" + extra + "}", id);
+  Json::Value& d = r["data"]["data"];
+  d["QORUMDPath"] = r["data"]["doc_id"] = path;
+  d["QORUMDFSName"] = d["QORUMDSearchFileName"] = name;
+  if (name.find('.') != std::string::npos) d["QORUMDExtension"] = name.substr(name.rfind('.') + 1);
+  if (!d.isMember("QORUMDFSSize")) d["QORUMDFSSize"] = 100;
+  if (!d.isMember("QORUMDFSContentChangeDate")) d["QORUMDFSContentChangeDate"] = 1000;
+  if (!d.isMember("QORUMDIsDir")) d["QORUMDIsDir"] = false;
+  return r;
 }
 
-inline Json::Value UpsertRequest(const std::string& id, const Json::Value& doc) {
-  Json::Value d(Json::objectValue);
-  d["id"] = id;
-  d["doc_id"] = doc["QORUMDPath"];
-  d["data"] = doc;
-  return Request("document_upsert_by_id", d);
+inline Json::Value Compound(const std::vector<Json::Value>& requests) {
+  Json::Value r;
+  r["compound"] = Json::arrayValue;
+  for (const Json::Value& q : requests) r["compound"].append(q);
+  return r;
 }
 
-inline Json::Value PrefixQuery(const std::string& prefix) {
-  Json::Value q(Json::objectValue);
-  q["qsl"]["prefix"]["QORUMDPath"] = prefix;
-  return q;
+// True when `got` has every member of `want` (a missing one counts as null),
+// recursively; arrays match in length, numbers by value.
+inline bool Holds(const Json::Value& got, const Json::Value& want) {
+  if (want.isNumeric()) return got.isNumeric() && got.asDouble() == want.asDouble();
+  if (!want.isArray() && !want.isObject()) return got == want;
+  if (got.type() != want.type() || (want.isArray() && got.size() != want.size())) return false;
+  for (auto it = want.begin(); it != want.end(); ++it) {
+    if (!Holds(want.isArray() ? got[it.index()] : got[it.name()], *it)) return false;
+  }
+  return true;
 }
 
 }  // namespace vellis::searchd::testing

@@ -1,5 +1,6 @@
 #include "fileindex/elastic/comm.h"
 
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
 #include <memory>
@@ -7,187 +8,128 @@
 #include "common/json_util.h"
 #include "common/root_path.h"
 #include "sdk/frame.h"
-#include "tests/support/fake_search_daemon.h"
+#include "tests/support/fake_daemon.h"
 #include "tests/support/parse_json.h"
 #include "tests/support/scripted_platform.h"
 #include "tests/support/temp_root.h"
+#include "tests/support/thrown.h"
 
 namespace vellis {
 namespace {
 
-using testing::FakeSearchDaemon;
-
+using testing::FakeDaemon;
+using ::testing::HasSubstr;
 using testing::ParseJson;
 
 class SendRequestImplTest : public ::testing::Test {
  protected:
-  void SetUp() override { old_timeouts_ = TEST_SetRequestTimeouts({100, 100}); }
-  void TearDown() override { TEST_SetRequestTimeouts(old_timeouts_); }
+  SendRequestImplTest() : old_timeouts_(TEST_SetRequestTimeouts({100, 100})) {}
+  ~SendRequestImplTest() override { TEST_SetRequestTimeouts(old_timeouts_); }
 
-  // A fresh daemon each time (the old one removes its socket file first).
-  FakeSearchDaemon& StartDaemon() {
-    daemon_.reset();
-    daemon_ = std::make_unique<FakeSearchDaemon>(RootPath(kElasticSocketPath));
-    return *daemon_;
+  // "<code> <reason>" of what SendRequestImpl throws; the answer goes to res_.
+  std::string Send(const Json::Value& req) {
+    return testing::Thrown([&] { SendRequestImpl(res_, req); });
   }
+  void StartDaemon() { daemon_ = std::make_unique<FakeDaemon>(RootPath(kElasticSocketPath)); }
 
   testing::TempRoot root_;
   testing::ScriptedPlatform platform_;
   testing::ScopedPlatform scoped_{&platform_};
-  std::unique_ptr<FakeSearchDaemon> daemon_;
-  RequestTimeouts old_timeouts_{};
+  std::unique_ptr<FakeDaemon> daemon_ = std::make_unique<FakeDaemon>(RootPath(kElasticSocketPath));
+  RequestTimeouts old_timeouts_;
   Json::Value req_ = ParseJson(R"({"command":"commit","data":{"id":"fileindex_music"}})");
+  Json::Value res_;
 };
 
-TEST_F(SendRequestImplTest, WaitsForASocketThatAppearsAfterThreeSeconds) {
-  platform_.SetOnSleep([this](unsigned, size_t sleeps) {
-    if (sleeps == 3) StartDaemon();
-  });
-  Json::Value res;
-  SendRequestImpl(res, req_);
-  EXPECT_EQ(res, ParseJson(R"({"success":true})"));
-  EXPECT_EQ(platform_.Sleeps(), (std::vector<unsigned>{1, 1, 1}));
-  auto waits = platform_.LogsContaining("elastic socket is not ready, retry ... ");
-  ASSERT_EQ(waits.size(), 3u);
-  for (size_t i = 0; i < waits.size(); ++i) {
-    EXPECT_NE(waits[i].find("comm.cpp:"), std::string::npos) << waits[i];
-    EXPECT_NE(waits[i].find("retry ... " + std::to_string(i + 1)), std::string::npos) << waits[i];
-  }
-  ASSERT_EQ(daemon_->Requests().size(), 1u);
-  EXPECT_EQ(daemon_->Requests()[0], req_);
-}
-
-TEST_F(SendRequestImplTest, GivesUpWaitingAfterFifteenSecondsAndFailsToConnect) {
-  Json::Value res;
-  try {
-    SendRequestImpl(res, req_);
-    FAIL() << "no daemon, yet no error";
-  } catch (const Error& e) {
-    EXPECT_EQ(e.GetCode(), kErrDaemonUnreachable);
-    EXPECT_STREQ(e.what(), "Connect failed");
-  }
+TEST_F(SendRequestImplTest, WaitsUpToFifteenSecondsForTheSocketThenConnectsAnyway) {
+  daemon_.reset();
+  EXPECT_EQ(Send(req_), "913 Connect failed");
   EXPECT_EQ(platform_.Sleeps(), std::vector<unsigned>(15, 1));
   auto waits = platform_.LogsContaining("elastic socket is not ready, retry ... ");
   ASSERT_EQ(waits.size(), 15u);
-  EXPECT_NE(waits.back().find("retry ... 15"), std::string::npos) << waits.back();
-  EXPECT_EQ(platform_.LogsContaining("Failed [!conn.Connect()], reason: Connect failed").size(),
-            1u);
-}
-
-TEST_F(SendRequestImplTest, ReturnsTheWholeAnswer) {
-  for (const char* answer :
-       {R"({"success":true})", R"({"success":true,"data":[{"QORUMDPath":"/v/s/a"}]})"}) {
-    StartDaemon().Push(FakeSearchDaemon::Raw(answer));
-    Json::Value res;
-    SendRequestImpl(res, req_);
-    EXPECT_EQ(res, ParseJson(answer)) << answer;
+  for (size_t i = 0; i < waits.size(); ++i) {
+    EXPECT_THAT(waits[i], HasSubstr("comm.cpp:"));
+    EXPECT_THAT(waits[i], HasSubstr("retry ... " + std::to_string(i + 1)));
   }
-  EXPECT_TRUE(platform_.Sleeps().empty());
+  // A socket that appears during the third wait of the next call is used.
+  platform_.SetOnSleep([this](unsigned, size_t sleeps) {
+    if (sleeps != 18) return;
+    StartDaemon();
+    daemon_->Push(FakeDaemon::Success(ParseJson(R"([{"QORUMDPath":"/v/s/a"}])")));
+  });
+  EXPECT_EQ(Send(req_), "no error");
+  EXPECT_EQ(res_, ParseJson(R"({"success":true,"data":[{"QORUMDPath":"/v/s/a"}]})"));
+  EXPECT_EQ(daemon_->Requests(), std::vector<Json::Value>{req_});
+  EXPECT_EQ(platform_.Sleeps().size(), 18u);
 }
 
-TEST_F(SendRequestImplTest, RefusesBadAnswersWithAClearError) {
+TEST_F(SendRequestImplTest, RefusesAnswersThatAreNotWholeJsonObjectsWithBoolSuccess) {
+  const std::string ok = R"({"success":true})";
   struct Case {
-    FakeSearchDaemon::Reply reply;
-    int code;
-    std::string reason;
+    FakeDaemon::Reply reply;
+    std::string thrown;
   } cases[] = {
-      {FakeSearchDaemon::Raw("not json"), 913, "Recv failed, res=not json"},
-      {FakeSearchDaemon::Raw(std::string(10000, 'x')), 913,
-       "Recv failed, res=" + std::string(4096, 'x') + "...(10000 bytes)"},
-      {FakeSearchDaemon::Raw(R"({"data":1})"), 913, R"(Recv failed, res={"data":1})"},
-      {FakeSearchDaemon::Raw(R"({"success":"yes"})"), 913, R"(Recv failed, res={"success":"yes"})"},
-      {FakeSearchDaemon::Raw("[true]"), 913, "Recv failed, res=[true]"},
-      {FakeSearchDaemon::Raw(R"({"success":true} x)"), 913,
-       R"(Recv failed, res={"success":true} x)"},
-      {FakeSearchDaemon::HeaderOnly(sdk::kMaxMessageSize + 1), 913, "Recv failed, res="},
-      {FakeSearchDaemon::HeaderOnly(0), 913, "Recv failed, res="},
-      {FakeSearchDaemon::CloseMidMessage(100, R"({"succ)"), 913, "Recv failed, res="},
-      {FakeSearchDaemon::CloseEarly(), 913, "Recv failed, res="},
-      {FakeSearchDaemon::Silence(), 913, "Recv failed, res="},
-      {FakeSearchDaemon::Trickle(R"({"success":true})", 40), 913, "Recv failed, res="},
-      {FakeSearchDaemon::Failure(5, "no such index"), 5, "Request failed, msg=no such index"},
-      {FakeSearchDaemon::Busy(1401), 1401, "Request failed, msg=busy"},
-      {FakeSearchDaemon::Raw(R"({"success":false})"), 120, "Missing property: error"},
-      {FakeSearchDaemon::Raw(R"({"success":false,"error":{"msg":"m"}})"), 120,
-       "Missing property: code"},
-      {FakeSearchDaemon::Raw(R"({"success":false,"error":{"code":7}})"), 120,
-       "Missing property: msg"},
+      {FakeDaemon::Raw("not json"), "913 Recv failed, res=not json"},
+      {FakeDaemon::Raw(std::string(10000, 'x')),
+       "913 Recv failed, res=" + std::string(4096, 'x') + "...(10000 bytes)"},
+      {FakeDaemon::Raw(R"({"data":1})"), R"(913 Recv failed, res={"data":1})"},
+      {FakeDaemon::Raw(R"({"success":"yes"})"), R"(913 Recv failed, res={"success":"yes"})"},
+      {FakeDaemon::Raw("[true]"), "913 Recv failed, res=[true]"},
+      {FakeDaemon::Raw(ok + " x"), "913 Recv failed, res=" + ok + " x"},
+      {{sdk::EncodeFrameHeader(0)}, "913 Recv failed, res="},
+      {{sdk::EncodeFrameHeader(100) + R"({"succ)", true}, "913 Recv failed, res="},
+      {{"", true}, "913 Recv failed, res="},                              // closed at once
+      {{""}, "913 Recv failed, res="},                                    // silent
+      {{FakeDaemon::Raw(ok).bytes, false, 40}, "913 Recv failed, res="},  // too slow
+      {FakeDaemon::Failure(5, "no such index"), "5 Request failed, msg=no such index"},
+      {FakeDaemon::Busy(1401), "1401 Request failed, msg=busy"},
+      {FakeDaemon::Raw(R"({"success":false})"),
+       R"(120 Missing property: error, data={"success":false})"},
+      {FakeDaemon::Raw(R"({"success":false,"error":{"msg":"m"}})"),
+       R"(120 Missing property: code, data={"msg":"m"})"},
+      {FakeDaemon::Raw(R"({"success":false,"error":{"code":7}})"),
+       R"(120 Missing property: msg, data={"code":7})"},
   };
   for (const auto& c : cases) {
-    StartDaemon().Push(c.reply);
-    Json::Value res;
-    try {
-      SendRequestImpl(res, req_);
-      ADD_FAILURE() << "no error for " << c.reason;
-    } catch (const Error& e) {
-      EXPECT_EQ(e.GetCode(), c.code) << c.reason;
-      EXPECT_EQ(std::string(e.what()).substr(0, c.reason.size()), c.reason);
-    }
+    daemon_->Push(c.reply);
+    EXPECT_EQ(Send(req_), c.thrown);
   }
-  EXPECT_EQ(platform_.LogsContaining("above the maximum").size(), 1u);
-  EXPECT_EQ(platform_.LogsContaining("receive timed out").size(), 2u);
+  EXPECT_EQ(daemon_->Requests(), std::vector<Json::Value>(std::size(cases), req_));
+  EXPECT_EQ(platform_.LogsContaining("receive timed out").size(), 2u) << "silent and too slow";
 }
 
-TEST_F(SendRequestImplTest, CompoundAnswerThrowsOnBusySubRequestAfterLoggingOthers) {
-  Json::Value req = ParseJson(R"({"compound":[
-      {"command":"document_set_by_id","data":{"id":"fileindex_s","doc_id":"/v/s/a"}},
-      {"command":"document_set_by_id","data":{"id":"fileindex_s","doc_id":"/v/s/b"}},
-      {"command":"document_set_by_id","data":{"id":"fileindex_s","doc_id":"/v/s/c"}}]})");
-  StartDaemon().Push(FakeSearchDaemon::Raw(R"({"success":true,"has_fail":true,"data":[
-      {"success":false,"error":{"code":5,"msg":"bad doc"}},
-      {"success":false,"error":{"code":1400,"msg":"queue full"}},
-      {"success":false,"error":{"code":6,"msg":"never reached"}}]})"));
-  Json::Value res;
-  try {
-    SendRequestImpl(res, req);
-    FAIL() << "busy sub-request not reported";
-  } catch (const Error& e) {
-    EXPECT_EQ(e.GetCode(), 1400);
-    EXPECT_STREQ(e.what(), "queue full");
-  }
-  auto logged = platform_.LogsContaining("Compound failed: ");
-  ASSERT_EQ(logged.size(), 1u);
-  EXPECT_NE(logged[0].find("(SendRequestImpl) Compound failed: " +
-                           JsonToString(req["compound"][0]) + " (5) bad doc"),
-            std::string::npos)
-      << logged[0];
-}
-
-TEST_F(SendRequestImplTest, CompoundAnswerWithOtherFailuresSucceeds) {
-  Json::Value req =
+TEST_F(SendRequestImplTest, CompoundAnswerReportsOnlyABusySubRequest) {
+  const Json::Value req =
       ParseJson(R"({"compound":[{"command":"a","data":{}},{"command":"b","data":{}}]})");
   const std::string failed = R"([{"success":false,"error":{"code":5,"msg":"x"}},
-                                {"success":false,"error":{"code":6,"msg":"y"}}])";
+                                 {"success":false,"error":{"code":1400,"msg":"queue full"}},
+                                 {"success":false,"error":{"code":6,"msg":"y"}}])";
+  const std::string no_busy = R"([{"success":false,"error":{"code":5,"msg":"x"}},
+                                  {"success":false,"error":{"code":6,"msg":"y"}}])";
   struct Case {
     std::string answer;
     const Json::Value& request;
+    std::string thrown;
     size_t logged;
   } cases[] = {
-      {R"({"success":true,"has_fail":true,"data":)" + failed + "}", req, 2},
-      {R"({"success":true,"has_fail":false,"data":)" + failed + "}", req, 0},
-      {R"({"success":true,"data":)" + failed + "}", req, 0},
-      {R"({"success":true,"has_fail":true,"data":)" + failed + "}", req_, 0},  // not compound
+      {R"({"success":true,"has_fail":true,"data":)" + failed + "}", req, "1400 queue full", 1},
+      {R"({"success":true,"has_fail":true,"data":)" + no_busy + "}", req, "no error", 2},
+      {R"({"success":true,"has_fail":false,"data":)" + failed + "}", req, "no error", 0},
+      {R"({"success":true,"data":)" + failed + "}", req, "no error", 0},
+      {R"({"success":true,"has_fail":true,"data":)" + failed + "}", req_, "no error", 0},
+      {R"({"success":true,"has_fail":true,"data":{}})", req,
+       R"(913 Compound answer without data array, res={"success":true,"has_fail":true,"data":{}})",
+       0},
   };
   for (const auto& c : cases) {
     platform_.ClearLogs();
-    StartDaemon().Push(FakeSearchDaemon::Raw(c.answer));
-    Json::Value res;
-    EXPECT_NO_THROW(SendRequestImpl(res, c.request)) << c.answer;
-    EXPECT_EQ(res, ParseJson(c.answer));
-    EXPECT_EQ(platform_.LogsContaining("Compound failed").size(), c.logged) << c.answer;
-  }
-}
-
-TEST_F(SendRequestImplTest, CompoundAnswerWithoutDataArrayIsRefused) {
-  Json::Value req = ParseJson(R"({"compound":[]})");
-  StartDaemon().Push(FakeSearchDaemon::Raw(R"({"success":true,"has_fail":true,"data":{}})"));
-  Json::Value res;
-  try {
-    SendRequestImpl(res, req);
-    FAIL() << "accepted";
-  } catch (const Error& e) {
-    EXPECT_EQ(e.GetCode(), kErrDaemonUnreachable);
-    EXPECT_NE(std::string(e.what()).find("without data array"), std::string::npos) << e.what();
+    daemon_->Push(FakeDaemon::Raw(c.answer));
+    EXPECT_EQ(Send(c.request), c.thrown) << c.answer;
+    auto logs = platform_.LogsContaining("(SendRequestImpl) Compound failed: ");
+    ASSERT_EQ(logs.size(), c.logged) << c.answer;
+    for (Json::ArrayIndex i = 0; i < c.logged; ++i) {
+      EXPECT_THAT(logs[i], HasSubstr(JsonToString(req["compound"][i]) + (i ? " (6) y" : " (5) x")));
+    }
   }
 }
 
