@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <regex>
 #include <string>
 #include <vector>
 
@@ -17,10 +16,12 @@ TEST(SchemaTest, MappingsListFiftyThreeFieldsInTheirFixedOrder) {
   // The JSON library hands members back sorted by key, so the order that the
   // daemon sees is read off the template text.
   const std::string text = kFileIndexMappingsText;
-  const std::regex property("\n    \"(\\w+)\": \\{");
+  // Each property sits on its own line: `    "<name>": {...`.
+  const std::string start = "\n    \"";
   std::vector<std::string> keys;
-  for (std::sregex_iterator it(text.begin(), text.end(), property), end; it != end; ++it) {
-    keys.push_back((*it)[1]);
+  for (size_t at = text.find(start); at != std::string::npos; at = text.find(start, at + 1)) {
+    const size_t name = at + start.size();
+    keys.push_back(text.substr(name, text.find('"', name) - name));
   }
   EXPECT_EQ(mappings["property_id"], kQORUMDPath);
   ASSERT_EQ(keys.size(), static_cast<size_t>(kFileIndexMappedFields));
