@@ -1,292 +1,294 @@
-// The folder list and its file: loading, saving, updates, sorting and paging.
+// The folder record and its live status; the folder list and its file:
+// saving under several processes, updates, sorting and paging, and which
+// folder covers and governs a path (/musicbox is not below /music).
 #include "fileindex/folder_mgr.h"
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <signal.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <functional>
-#include <memory>
-#include <string>
-#include <vector>
+#include <set>
 
-#include "common/error.h"
-#include "common/json_util.h"
+#include "common/fs_util.h"
+#include "common/lock_file.h"
+#include "common/root_path.h"
 #include "tests/support/folder_env.h"
+#include "tests/support/parse_json.h"
 
 namespace vellis::fileindex {
 namespace {
 
-using testing::FolderEnv;
+using Strings = std::vector<std::string>;
 using testing::MakeFolder;
-using testing::ReadFile;
+using testing::ParseJson;
 using testing::Thrown;
 using testing::WriteFile;
 
-std::vector<std::string> Paths(const std::vector<std::shared_ptr<Folder>>& folders) {
-  std::vector<std::string> paths;
-  for (const auto& f : folders) paths.push_back(f->GetPath());
-  return paths;
+// Optional keys default, and mistyped ones keep their defaults.
+TEST(FolderJsonTest, LoadingAndGetDataAreInverses) {
+  Folder plain("/music", "music", true, true, false, true, false, false);
+  Folder flagged("/photo/2019", "Trip", false, false, true, false, true, true);
+  Folder cleaning = plain;
+  cleaning.SetVolumeToBeClean("/volume2");
+  for (const Folder& f : {plain, flagged, cleaning}) EXPECT_TRUE(Folder(f.GetData()) == f);
+  EXPECT_FALSE(plain == cleaning || plain == flagged);
+  Json::Value data = ParseJson(
+      R"({"path":"/music","name":"music","document":true,"audio":true,"video":false,"photo":true,
+          "paused":"true","volume_to_be_clean":[],"unknown":1})");
+  EXPECT_EQ(Folder(data).GetData(), plain.GetData());
 }
 
-// The four content flags as "DAVP" letters, "-" where off.
-std::string Flags(const Folder& f) {
-  return std::string(f.IsDocument() ? "D" : "-") + (f.IsAudio() ? "A" : "-") +
-         (f.IsVideo() ? "V" : "-") + (f.IsPhoto() ? "P" : "-");
-}
-
-class FolderMgrTest : public ::testing::Test {
+class FolderMgrTest : public testing::FolderEnvTest {
  protected:
   FolderMgrTest() {
-    env_.AddShare("music");
-    env_.AddShare("photo");
+    for (const char* share : {"music", "musicbox", "photo", "s"}) AddShare(share);
+    testing::MakeDirs(Volume() + "/s/dir");
+    platform_.SetTime(1700000000);
   }
 
-  // The paths in the folders file, in file order.
-  std::vector<std::string> SavedPaths() {
-    Json::Value saved;
-    EXPECT_TRUE(JsonFromFile(saved, env_.FoldersFile()));
-    std::vector<std::string> paths;
-    for (const Json::Value& f : saved) paths.push_back(f["path"].asString());
+  void Add(const std::shared_ptr<Folder>& folder) {
+    std::shared_ptr<Folder> changed;
+    mgr_.Upsert(changed, folder);
+  }
+
+  Strings Saved() {
+    Strings paths;
+    for (const Json::Value& f : ParseJson(testing::ReadFile(FoldersFile()))) {
+      paths.push_back(f["path"].asString());
+    }
     return paths;
   }
 
-  FolderEnv env_;
-};
-
-TEST_F(FolderMgrTest, NoFileIsAnEmptyListAndSaveWritesAnEmptyArray) {
-  FolderMgr mgr;
-  std::vector<std::shared_ptr<Folder>> out;
-  unsigned int total = 7;
-  mgr.List(out, total, 0, 50, "name", "asc");
-  EXPECT_EQ(total, 0u);
-  EXPECT_TRUE(out.empty());
-  mgr.Save();
-  Json::Value saved;
-  ASSERT_TRUE(JsonFromFile(saved, env_.FoldersFile()));
-  EXPECT_EQ(saved, Json::Value(Json::arrayValue));
-}
-
-TEST_F(FolderMgrTest, UnreadableFileIsRefusedAndLeftUntouched) {
-  const char* contents[] = {"[{\"path\":", "", "{}", "\"x\"", "[1,2", "null", "\x01\x02"};
-  for (const char* content : contents) {
-    WriteFile(env_.FoldersFile(), content);
-    std::string thrown = Thrown([] { FolderMgr mgr; });
-    EXPECT_EQ(thrown, "504 Cannot load json: " + env_.FoldersFile()) << "[" << content << "]";
-    EXPECT_EQ(ReadFile(env_.FoldersFile()), content);
-  }
-}
-
-TEST_F(FolderMgrTest, ElementWithoutRequiredKeyAbortsTheLoad) {
-  std::string good = JsonToString(MakeFolder("/music")->GetData());
-  WriteFile(env_.FoldersFile(), "[" + good + R"(,{"path":"/photo","name":"p","document":true}])");
-  EXPECT_EQ(Thrown([] { FolderMgr mgr; }).rfind("120 Missing property: audio", 0), 0u);
-}
-
-TEST_F(FolderMgrTest, SaveKeepsOrderAndFieldsAndSetsMode0644) {
-  WriteFile(env_.FoldersFile(), "[]");
-  chmod(env_.FoldersFile().c_str(), 0600);
-  std::shared_ptr<Folder> changed;
-  {
-    FolderMgr mgr;
-    auto paused = MakeFolder("/photo/2019", "Trip", false, true, false, true);
-    paused->SetPaused(true);
-    paused->SetVolumeToBeClean("/volume2");
-    mgr.Upsert(changed, MakeFolder("/music"));
-    mgr.Upsert(changed, paused);
-    mgr.Save();
-  }
-  Json::Value saved;
-  ASSERT_TRUE(JsonFromFile(saved, env_.FoldersFile()));
-  ASSERT_EQ(saved.size(), 2u);
-  EXPECT_EQ(saved[0], MakeFolder("/music")->GetData());
-  EXPECT_EQ(saved[1]["paused"], true);
-  EXPECT_EQ(saved[1]["volume_to_be_clean"], "/volume2");
-  struct stat st;
-  ASSERT_EQ(stat(env_.FoldersFile().c_str(), &st), 0);
-  EXPECT_EQ(st.st_mode & 07777, 0644u);
-}
-
-TEST_F(FolderMgrTest, SaveRemovesOnlyTemporaryFilesOfSavesLongGone) {
-  const std::string stale = env_.FoldersFile() + ".tmp-Ab12Cd";
-  const std::string fresh = env_.FoldersFile() + ".tmp-Ef34Gh";
-  const std::string other = env_.FoldersFile() + ".bak";
-  for (const std::string& f : {stale, fresh, other}) WriteFile(f, "[");
-  struct stat st;
-  ASSERT_EQ(stat(fresh.c_str(), &st), 0);
-  // Two minutes older than the file system's own clock says now.
-  const timespec times[2] = {{st.st_mtime - 120, 0}, {st.st_mtime - 120, 0}};
-  ASSERT_EQ(utimensat(AT_FDCWD, stale.c_str(), times, 0), 0);
-  ASSERT_EQ(utimensat(AT_FDCWD, other.c_str(), times, 0), 0);
-  FolderMgr().Save();
-  EXPECT_NE(stat(stale.c_str(), &st), 0) << "a killed save's file stays";
-  EXPECT_EQ(stat(fresh.c_str(), &st), 0) << "a save under way may own it";
-  EXPECT_EQ(stat(other.c_str(), &st), 0);
-}
-
-TEST_F(FolderMgrTest, UpsertOfAKnownPathReplacesItAndMovesItToTheEnd) {
-  FolderMgr mgr;
-  std::shared_ptr<Folder> changed;
-  for (const char* path : {"/music/a", "/music/b", "/music/c"})
-    mgr.Upsert(changed, MakeFolder(path));
-  mgr.Upsert(changed, MakeFolder("/music/a", "renamed", false, true, true, true));
-  mgr.Save();
-  Json::Value saved;
-  ASSERT_TRUE(JsonFromFile(saved, env_.FoldersFile()));
-  ASSERT_EQ(saved.size(), 3u);
-  EXPECT_EQ(saved[0]["path"], "/music/b");
-  EXPECT_EQ(saved[1]["path"], "/music/c");
-  EXPECT_EQ(saved[2]["path"], "/music/a");
-  EXPECT_EQ(saved[2]["name"], "renamed");
-}
-
-TEST_F(FolderMgrTest, The1001stDistinctFolderFailsAndTheFileStaysAsItWas) {
-  {
-    FolderMgr mgr;
-    std::shared_ptr<Folder> changed;
-    for (size_t i = 0; i < kFileIndexFoldersMax; ++i) {
-      mgr.Upsert(changed, MakeFolder("/music/d" + std::to_string(i)));
+  // Runs `body` in a child process: exit 0 when it returns, 1 when it throws.
+  static pid_t Spawn(const std::function<void()>& body) {
+    pid_t pid = fork();
+    if (pid != 0) return pid;
+    try {
+      body();
+    } catch (...) {
+      _exit(1);
     }
-    mgr.Upsert(changed, MakeFolder("/music/d0", "again"));  // a replacement still fits
-    mgr.Save();
-  }
-  const std::string before = ReadFile(env_.FoldersFile());
-  FolderMgr mgr;
-  std::shared_ptr<Folder> changed;
-  EXPECT_EQ(Thrown([&] { mgr.Upsert(changed, MakeFolder("/music/extra")); }), "900 ");
-  EXPECT_EQ(ReadFile(env_.FoldersFile()), before);
-  EXPECT_EQ(SavedPaths().size(), kFileIndexFoldersMax);
-}
-
-TEST_F(FolderMgrTest, UpsertReportsTheChangeAgainstTheGoverningFolder) {
-  FolderMgr mgr;
-  std::shared_ptr<Folder> changed;
-  mgr.Upsert(changed, MakeFolder("/music", "m", true, false, true, false));
-  EXPECT_EQ(Flags(*changed), "DAVP") << "nothing governed /music before";
-  EXPECT_EQ(changed->GetPath(), "/music");
-  mgr.Upsert(changed, MakeFolder("/music/live", "l", true, false, true, false));
-  EXPECT_EQ(Flags(*changed), "----") << "same flags as the parent";
-  mgr.Upsert(changed, MakeFolder("/music/studio", "s", false, true, true, false));
-  EXPECT_EQ(Flags(*changed), "DA--");
-  EXPECT_FALSE(changed->IsPrivileged() || changed->IsPaused());
-}
-
-TEST_F(FolderMgrTest, DeleteReportsTheChangeAgainstWhatGovernsAfterwards) {
-  FolderMgr mgr;
-  std::shared_ptr<Folder> changed;
-  mgr.Upsert(changed, MakeFolder("/music", "m", true, false, false, false));
-  mgr.Upsert(changed, MakeFolder("/music/live", "l", true, true, false, true));
-  mgr.Upsert(changed, MakeFolder("/photo"));
-  mgr.Delete(changed, "/music/live");
-  EXPECT_EQ(Flags(*changed), "-A-P");
-  EXPECT_EQ(changed->GetPath(), "/music/live");
-  mgr.Delete(changed, "/music");
-  EXPECT_EQ(Flags(*changed), "DAVP") << "nothing governs /music any more";
-  EXPECT_FALSE(mgr.HasFolder("/music"));
-  EXPECT_EQ(Thrown([&] { mgr.Delete(changed, "/music/none"); }), "902 /music/none");
-}
-
-TEST_F(FolderMgrTest, DeleteByShareRemovesOnlyThatShare) {
-  env_.AddShare("music2");
-  FolderMgr mgr;
-  std::shared_ptr<Folder> changed;
-  for (const char* path : {"/music/a", "/music2/b", "/photo", "/music"}) {
-    mgr.Upsert(changed, MakeFolder(path));
-  }
-  mgr.DeleteByShare("music");
-  mgr.Save();
-  EXPECT_EQ(SavedPaths(), (std::vector<std::string>{"/music2/b", "/photo"}));
-}
-
-TEST_F(FolderMgrTest, GetFindsByExactPath) {
-  FolderMgr mgr;
-  std::shared_ptr<Folder> changed;
-  mgr.Upsert(changed, MakeFolder("/music/Live", "live"));
-  std::shared_ptr<Folder> out;
-  mgr.Get(out, "/music/Live");
-  EXPECT_EQ(out->GetName(), "live");
-  EXPECT_EQ(Thrown([&] { mgr.Get(out, "/music/live"); }), "902 /music/live");
-  EXPECT_EQ(Thrown([&] { mgr.Get(out, "/music/Live/"); }), "902 /music/Live/");
-}
-
-class FolderListTest : public FolderMgrTest {
- protected:
-  FolderListTest() {
-    std::shared_ptr<Folder> changed;
-    // Flags chosen so that each key splits the list differently.
-    mgr_.Upsert(changed, MakeFolder("/music/b", "delta", true, false, true, false));
-    mgr_.Upsert(changed, MakeFolder("/music/C", "Alpha", false, true, true, false));
-    mgr_.Upsert(changed, MakeFolder("/music/a", "charlie", false, false, false, true));
-    mgr_.Upsert(changed, MakeFolder("/music/D", "Bravo", true, true, false, true));
-    mgr_.Upsert(changed, MakeFolder("/music/e", "echo", false, false, false, false));
-  }
-
-  std::vector<std::shared_ptr<Folder>> Page(unsigned int offset, unsigned int limit,
-                                            const std::string& sort_by,
-                                            const std::string& direction) {
-    std::vector<std::shared_ptr<Folder>> out;
-    unsigned int total = 0;
-    mgr_.List(out, total, offset, limit, sort_by, direction);
-    EXPECT_EQ(total, 5u) << sort_by << " " << direction;
-    return out;
+    _exit(0);
   }
 
   FolderMgr mgr_;
 };
 
-TEST_F(FolderListTest, TextKeysSortIgnoringCaseBothWays) {
+TEST_F(FolderMgrTest, EachStatusTextInOrderOfPrecedence) {
+  const std::string s = Volume() + "/s";
+  auto line = [](const std::string& path) { return R"({"event":2,"path":")" + path + "\"}\n"; };
   struct Case {
-    const char* sort_by;
-    const char* direction;
-    std::vector<std::string> expected;
+    std::string status_file, queue, queue_tmp, expected;
   } cases[] = {
-      {"path", "asc", {"/music/a", "/music/b", "/music/C", "/music/D", "/music/e"}},
-      {"path", "desc", {"/music/e", "/music/D", "/music/C", "/music/b", "/music/a"}},
-      {"name", "asc", {"/music/C", "/music/D", "/music/a", "/music/b", "/music/e"}},
-      {"name", "desc", {"/music/e", "/music/b", "/music/a", "/music/D", "/music/C"}},
-      {"size", "", {"/music/C", "/music/D", "/music/a", "/music/b", "/music/e"}},
-      {"name", "DESC", {"/music/C", "/music/D", "/music/a", "/music/b", "/music/e"}},
+      {"", "", "", "finished"},
+      {"", line(s + "/dir/a"), "", "processing"},
+      {"", "", line(s + "/dir"), "processing"},
+      {R"({"resume_time":0})", line(s + "/dir/a"), "", "paused"},
+      {R"({"resume_time":1700003600})", line(s + "/dir/a"), "", "paused"},
+      {R"({"resume_time":1700000000})", line(s + "/dir/a"), "", "processing"},
+      {R"({"share":{"s":1}})", "", "", "need_reindex"},
+      {R"({"resume_time":0,"share":{"s":3}})", line(s + "/dir/a"), "", "need_reindex"},
+      {R"({"share":{"s":2}})", "", "", "finished"},
   };
   for (const Case& c : cases) {
-    EXPECT_EQ(Paths(Page(0, 50, c.sort_by, c.direction)), c.expected)
-        << c.sort_by << " " << c.direction;
+    const std::string contents[] = {c.status_file, c.queue, c.queue_tmp};
+    const std::string files[] = {StatusFile(), QueuePath("s"), QueuePath("s") + ".tmp"};
+    for (int i = 0; i < 3; ++i) {
+      Unlink(files[i]);
+      if (!contents[i].empty()) WriteFile(files[i], contents[i]);
+    }
+    Json::Value out;
+    Folder("/s/dir", "dir", true, true, true, true, false, false).GetStatus(out);
+    EXPECT_EQ(out["text"], c.expected) << c.status_file << " " << c.queue << c.queue_tmp;
+  }
+  // A path that cannot be indexed is an error whatever else holds.
+  for (const char* path : {"/s/missing", "/s/dir/"}) {
+    Json::Value out;
+    Folder(path, "m", 1, 1, 1, 1, 0, 0).GetStatus(out);
+    EXPECT_EQ(out, ParseJson(R"({"text":"error","desc":"invalid_path"})")) << path;
   }
 }
 
-TEST_F(FolderListTest, FlagKeysPutFoldersWithoutTheFlagFirstOrLastWithDesc) {
+// A killed save's temporary file goes; one that a save under way may own
+// stays; the file is readable by all.
+TEST_F(FolderMgrTest, SaveRemovesOnlyTemporaryFilesOfSavesLongGone) {
+  const std::string stale = FoldersFile() + ".tmp-Ab12Cd", fresh = FoldersFile() + ".tmp-Ef34Gh",
+                    other = FoldersFile() + ".bak";
+  for (const std::string& f : {stale, fresh, other, FoldersFile()}) WriteFile(f, "[");
+  chmod(FoldersFile().c_str(), 0600);
+  struct stat st;
+  ASSERT_EQ(stat(fresh.c_str(), &st), 0);
+  const timespec times[2] = {{st.st_mtime - 120, 0}, {st.st_mtime - 120, 0}};
+  ASSERT_EQ(utimensat(AT_FDCWD, stale.c_str(), times, 0), 0);
+  ASSERT_EQ(utimensat(AT_FDCWD, other.c_str(), times, 0), 0);
+  mgr_.Save();
+  EXPECT_NE(stat(stale.c_str(), &st), 0);
+  EXPECT_EQ(stat(fresh.c_str(), &st) + stat(other.c_str(), &st), 0);
+  ASSERT_EQ(stat(FoldersFile().c_str(), &st), 0);
+  EXPECT_EQ(st.st_mode & 07777, 0644u);
+}
+
+// The change reported is the categories that differ from the governing
+// folder's, as a plain record: never privileged or paused.
+TEST_F(FolderMgrTest, UpsertReportsTheCategoriesThatChangeAgainstTheGoverningFolder) {
+  std::shared_ptr<Folder> changed;
+  Add(MakeFolder("/music", "m", true, false, true, false));
+  mgr_.Upsert(changed,
+              std::make_shared<Folder>("/music/sub", "s", false, false, true, true, true, true));
+  EXPECT_EQ(changed->GetIndexCfg(),
+            ParseJson(R"({"document":true,"audio":false,"video":false,"photo":true})"));
+  EXPECT_FALSE(changed->IsPrivileged() || changed->IsPaused());
+  for (const char* path : {"/music/a", "/musicbox/b", "/photo"}) Add(MakeFolder(path));
+  mgr_.DeleteByShare("music");
+  mgr_.Save();
+  EXPECT_EQ(Saved(), (Strings{"/musicbox/b", "/photo"}));
+}
+
+// Text keys ignore case, flag keys put folders without the flag first;
+// unknown keys sort by name, unknown directions ascending.
+TEST_F(FolderMgrTest, ListSortsAndPages) {
+  Add(MakeFolder("/music/b", "delta", true, false, true, false));
+  Add(MakeFolder("/music/C", "Alpha", false, true, true, false));
+  Add(MakeFolder("/music/a", "charlie", false, false, false, true));
+  Add(MakeFolder("/music/D", "Bravo", true, true, false, true));
+  Add(MakeFolder("/music/e", "echo", false, false, false, false));
+  auto list = [&](unsigned int offset, unsigned int limit, const char* key, const char* dir) {
+    std::vector<std::shared_ptr<Folder>> out;
+    unsigned int total = 0;
+    mgr_.List(out, total, offset, limit, key, dir);
+    EXPECT_EQ(total, 5u);
+    return out;
+  };
   struct Case {
-    const char* sort_by;
-    bool (Folder::*flag)() const;
-  } cases[] = {{"document", &Folder::IsDocument},
-               {"audio", &Folder::IsAudio},
-               {"video", &Folder::IsVideo},
-               {"photo", &Folder::IsPhoto}};
+    const char *sort_by, *direction;
+    unsigned int offset, limit;
+    std::string names;
+  } cases[] = {
+      {"path", "asc", 0, 50, "charlie delta Alpha Bravo echo "},
+      {"path", "desc", 0, 50, "echo Bravo Alpha delta charlie "},
+      {"name", "asc", 1, 3, "Bravo charlie delta "},
+      {"size", "DESC", 0, 50, "Alpha Bravo charlie delta echo "},
+      {"path", "asc", 4, 1, "echo "},
+      {"path", "asc", 5, 1, ""},
+  };
   for (const Case& c : cases) {
-    for (const std::string direction : {"asc", "desc"}) {
+    std::string names;
+    for (const auto& f : list(c.offset, c.limit, c.sort_by, c.direction))
+      names += f->GetName() + " ";
+    EXPECT_EQ(names, c.names) << c.sort_by << " " << c.direction << " " << c.offset;
+  }
+  for (const auto& [key, flag] : {std::pair{"document", &Folder::IsDocument},
+                                  {"audio", &Folder::IsAudio},
+                                  {"video", &Folder::IsVideo},
+                                  {"photo", &Folder::IsPhoto}}) {
+    for (const char* dir : {"asc", "desc"}) {
       std::string flags;
-      for (const auto& f : Page(0, 50, c.sort_by, direction)) flags += ((*f).*c.flag)() ? "1" : "0";
+      for (const auto& f : list(0, 50, key, dir)) flags += ((*f).*flag)() ? "1" : "0";
       std::string sorted = flags;
       std::sort(sorted.begin(), sorted.end());
-      if (direction == "desc") std::reverse(sorted.begin(), sorted.end());
-      EXPECT_EQ(flags, sorted) << c.sort_by << " " << direction;
+      if (dir[0] == 'd') std::reverse(sorted.begin(), sorted.end());
+      EXPECT_EQ(flags, sorted) << key << " " << dir;
     }
   }
 }
 
-TEST_F(FolderListTest, PagesAtAndPastTheEnd) {
+TEST_F(FolderMgrTest, TheDeepestCoveringFolderGoverns) {
+  Add(MakeFolder("/music", "music"));
+  Add(MakeFolder("/music/live", "live"));
+  Add(MakeFolder("/photo/2019", "first"));
+  Add(MakeFolder("/photo/2019", "replaced"));
   struct Case {
-    unsigned int offset;
-    unsigned int limit;
-    std::vector<std::string> expected;
+    std::string full_path, governing;
+    bool indexed, own_cfg;
   } cases[] = {
-      {2, 1, {"/music/C"}}, {3, 50, {"/music/D", "/music/e"}},
-      {4, 1, {"/music/e"}}, {5, 1, {}},
-      {7, 3, {}},           {0, 0, {}},
+      {"/music/live/a.mp3", "live", true, false},     {"/music/live", "live", true, true},
+      {"/music/studio/b.mp3", "music", true, false},  {"/music", "music", true, true},
+      {"/musicbox/c.mp3", "none", false, false},      {"/music/liveX/a", "music", true, false},
+      {"/photo/2019/x.jpg", "replaced", true, false}, {"/photo/2020/x.jpg", "none", false, false},
+      {"/MUSIC/a.mp3", "none", false, false},         {"/photo/2019/", "replaced", true, false},
   };
   for (const Case& c : cases) {
-    EXPECT_EQ(Paths(Page(c.offset, c.limit, "path", "asc")), c.expected)
-        << "offset " << c.offset << " limit " << c.limit;
+    const std::shared_ptr<Folder> cfg = mgr_.GetMostSuitableCfg(Volume() + c.full_path);
+    EXPECT_EQ(cfg ? cfg->GetName() : "none", c.governing) << c.full_path;
+    EXPECT_EQ(mgr_.IsFullPathIndexed(Volume() + c.full_path), c.indexed) << c.full_path;
+    EXPECT_EQ(mgr_.IsFullPathHasOwnCfg(Volume() + c.full_path), c.own_cfg) << c.full_path;
+  }
+  EXPECT_FALSE(mgr_.HasFolder("/music/live/") || mgr_.HasFolder("/musicbox"));
+  EXPECT_FALSE(mgr_.IsShareIndexed("musicbox") || mgr_.IsShareIndexed("mus"));
+  EXPECT_EQ(mgr_.GetIndexedShares(), (std::set<std::string>{"music", "photo"}));
+  std::shared_ptr<Folder> out;
+  EXPECT_EQ(Thrown([&] { mgr_.Get(out, "/Music/live"); }), "902 /Music/live");
+}
+
+TEST_F(FolderMgrTest, NeedMetaFollowsTheGoverningFoldersFlagForTheFileType) {
+  Add(MakeFolder("/music/docs", "docs", true, false, false, false));
+  Add(MakeFolder("/music/media", "media", false, true, true, true));
+  Add(MakeFolder("/music/none", "none", false, false, false, false));
+  struct Case {
+    std::string full_path;
+    bool expected;
+  } cases[] = {
+      {"/music/docs/a.PDF", true},   {"/music/docs/README", true},    {"/music/docs/a.mp3", false},
+      {"/music/media/a.pdf", false}, {"/music/media/a.flac", true},   {"/music/media/a.mkv", true},
+      {"/music/media/a.jpg", true},  {"/music/none/a.jpg", false},    {"/music/none/a.exe", true},
+      {"/musicbox/a.exe", false},    {"/music/media/.profile", true},
+  };
+  for (const Case& c : cases) {
+    EXPECT_EQ(mgr_.IsFullPathNeedMeta(Volume() + c.full_path), c.expected) << c.full_path;
+  }
+}
+
+TEST_F(FolderMgrTest, TwoWritersUnderTheFolderLockLoseNoUpdate) {
+  std::vector<pid_t> writers;
+  for (int w = 0; w < 2; ++w) {
+    writers.push_back(Spawn([w] {
+      for (int i = 0; i < 10; ++i) {
+        LockFile lock(RootPath(kFolderCfgLockPath), true);
+        FolderMgr mgr;
+        std::shared_ptr<Folder> changed;
+        mgr.Upsert(changed, MakeFolder("/music/w" + std::to_string(w) + "_" + std::to_string(i)));
+        mgr.Save();
+      }
+    }));
+  }
+  for (pid_t pid : writers) {
+    int status = -1;
+    waitpid(pid, &status, 0);
+    EXPECT_EQ(status, 0) << "writer " << pid << " failed";
+  }
+  const Strings saved = Saved();
+  EXPECT_EQ(std::set<std::string>(saved.begin(), saved.end()).size(), 20u);
+}
+
+// The writer alternates between the base list and the base list plus one
+// folder, saving as fast as it can until it is killed.
+TEST_F(FolderMgrTest, WriterKilledWhileSavingLeavesTheOldOrTheNewList) {
+  for (size_t i = 0; i < 200; ++i) Add(MakeFolder("/music/d" + std::to_string(i)));
+  mgr_.Save();
+  sdk::Platform* real = platform_.target();
+  for (int round = 0; round < 30; ++round) {
+    pid_t writer = Spawn([] {
+      FolderMgr mgr;
+      std::shared_ptr<Folder> changed;
+      for (int i = 0;; ++i) {
+        if (i % 2 == 0) mgr.Upsert(changed, MakeFolder("/music/extra"));
+        if (i % 2 == 1) mgr.Delete(changed, "/music/extra");
+        mgr.Save();
+      }
+    });
+    real->USleep(static_cast<uint64_t>(real->Rand() % 30000));
+    kill(writer, SIGKILL);
+    int status = 0;
+    waitpid(writer, &status, 0);
+    ASSERT_TRUE(WIFSIGNALED(status)) << "round " << round << ": the writer stopped by itself";
+    size_t total = 0;
+    EXPECT_EQ(Thrown([&] { total = FolderMgr().GetFolders().size(); }), "no error") << round;
+    EXPECT_TRUE(total == 200 || total == 201) << "round " << round << ": " << total;
   }
 }
 

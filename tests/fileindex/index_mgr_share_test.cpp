@@ -1,264 +1,294 @@
-// Pausing, resuming, forgetting and migrating shares: the order of the
-// steps, exact share names, and what a failure leaves done.
+// Pausing indexing, and keeping shares, volumes, renames, recycle bins and
+// the related services in step with the index: the order of the steps,
+// exact names (music2 is not music, /volume10 not /volume1), and what a
+// failure leaves done.
 #include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
+#include <cstdio>
 #include <functional>
-#include <string>
-#include <vector>
+#include <utility>
 
-#include "common/json_util.h"
+#include "common/root_path.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "tests/support/index_mgr_env.h"
+#include "tests/support/parse_json.h"
 
 namespace vellis::fileindex {
 namespace {
 
 using testing::FakeSearchDaemon;
-using testing::IndexMgrEnv;
-using testing::MakeDirs;
+using testing::ServiceCall;
+using testing::Strings;
 using testing::Thrown;
-using testing::WriteFile;
-using Call = testing::FakeServicesPlatform::ServiceCall;
 
-class ShareOpsTest : public ::testing::Test {
+const Strings kPauseSteps = {"worker_delete music", "index_pause fileindex_music",
+                             "MonitorQueueDelete"};
+
+class ShareOpsTest : public testing::IndexMgrTest {
  protected:
   ShareOpsTest() {
-    env_.AddShare("music");
-    env_.AddShare("music2");
-    env_.AddShare("photo");
-    for (const char* dir : {"/music/a", "/music/b", "/music2/c", "/photo/d"}) {
-      MakeDirs(env_.Volume() + dir);
-    }
-    Json::Value list(Json::arrayValue);
-    for (const char* path : {"/music/a", "/music2/c", "/music/b"}) {
-      list.append(IndexMgrEnv::FolderJson(path));
-    }
-    FolderAdd(list, false);
-    Reset();
+    AddShare("music", {"/a", "/b"});
+    AddShare("music2", {"/c"});
+    AddShare("photo", {"/a", "/b"});
+    AddShare("video", {"/v"}, "volume10");
   }
 
-  void Reset() { env_.ForgetSent(); }
-
-  // Everything that the operation did, in order of the pieces: daemon
-  // commands, then search requests, then monitor calls.
-  std::vector<std::string> Sent() const {
-    std::vector<std::string> out;
-    std::vector<std::string> daemon = env_.NewDaemonCommands();
-    out.insert(out.end(), daemon.begin(), daemon.end());
-    std::vector<std::string> search = env_.NewSearchCommands();
-    out.insert(out.end(), search.begin(), search.end());
-    for (const std::string& call : env_.platform().Calls()) {
-      if (call.rfind("MonitorQueue", 0) == 0) out.push_back(call);
+  // "<paused 0|1><volume_to_be_clean below the root>" per folder.
+  std::string Paused() const {
+    std::string out;
+    for (const Json::Value& f : FoldersFile()) {
+      const std::string volume = f["volume_to_be_clean"].asString();
+      out += std::string(out.empty() ? "" : " ") + (f["paused"].asBool() ? "1" : "0") +
+             volume.substr(volume.empty() ? 0 : root_.path().size());
     }
     return out;
   }
 
-  // The paused flag of each folder, in list order.
-  std::vector<bool> Paused() const {
-    std::vector<bool> out;
-    for (const Json::Value& f : env_.FoldersFile()) out.push_back(f["paused"].asBool());
-    return out;
-  }
-
-  IndexMgrEnv env_;
+  const std::string v1_ = Volume("volume1");
 };
 
-TEST_F(ShareOpsTest, PauseMarksOnlyTheSharesFoldersAndDropsItsMonitorQueue) {
-  env_.MarkFoldersFile();
+// Only the share's own folders are marked; a share without folders ("mus",
+// "photo") is left alone.
+TEST_F(ShareOpsTest, PauseAndResumeAreMirrorImagesOnTheSharesOwnFolders) {
+  Given({"/music/a", "/music2/c", "/music/b"});
   SharePause("music");
-  EXPECT_EQ(Sent(), (std::vector<std::string>{"worker_delete music", "index_pause fileindex_music",
-                                              "MonitorQueueDelete"}));
-  EXPECT_EQ(Paused(), (std::vector<bool>{true, false, true})) << "music2 is another share";
-  EXPECT_TRUE(env_.FoldersFileSaved());
-  EXPECT_FALSE(env_.MonitorQueues().isMember(env_.QueuePath("music")));
-  EXPECT_TRUE(env_.MonitorQueues().isMember(env_.QueuePath("music2")));
-  EXPECT_EQ(env_.QueueEvents("music").size(), 2u) << "the queue is not touched";
-}
-
-TEST_F(ShareOpsTest, PauseIsOrderedDaemonMonitorIndex) {
-  // A failure at each step shows which steps came before it.
-  struct Case {
-    const char* what;
-    std::function<void()> inject;
-    std::vector<std::string> sent;
-    bool monitor_removed;
-  } cases[] = {
-      {"daemon fails",
-       [&] {
-         env_.daemon().SetAnswerBytes("");
-         env_.daemon().SetCloseAfterAnswer(true);
-       },
-       {"worker_delete music"},
-       false},
-      {"monitor fails",
-       [&] { env_.platform().FailCall("MonitorQueueDelete", EIO); },
-       {"worker_delete music", "MonitorQueueDelete"},
-       false},
-      {"index fails",
-       [&] { env_.search().Push(FakeSearchDaemon::Failure(77, "no")); },
-       {"worker_delete music", "index_pause fileindex_music", "MonitorQueueDelete"},
-       true},
-  };
-  for (const Case& c : cases) {
-    Reset();
-    c.inject();
-    EXPECT_NE(Thrown([] { SharePause("music"); }), "no error") << c.what;
-    EXPECT_EQ(Sent(), c.sent) << c.what;
-    EXPECT_EQ(env_.MonitorQueues().isMember(env_.QueuePath("music")), !c.monitor_removed) << c.what;
-    EXPECT_EQ(Paused(), (std::vector<bool>{false, false, false})) << c.what << ": list saved";
-    env_.daemon().SetAnswerBytes(std::string("\x10\0\0\0{\"success\":true}", 20));
-    env_.daemon().SetCloseAfterAnswer(false);
-    env_.platform().ClearFailures();
-    // Calling again completes the pause.
-    ShareResume("music");
-  }
-  Reset();
-  SharePause("music");
-  EXPECT_EQ(Paused(), (std::vector<bool>{true, false, true}));
-}
-
-TEST_F(ShareOpsTest, ResumeGoesIndexMonitorWorkerAndClearsTheFlags) {
-  SharePause("music");
-  Reset();
+  EXPECT_EQ(Sent(), kPauseSteps);
+  EXPECT_EQ(Paused(), "1 0 1");
+  EXPECT_FALSE(MonitorQueues().isMember(QueuePath("music")));
+  EXPECT_EQ(MonitorPaths("music2").size(), 1u);
+  ForgetSent();
   ShareResume("music");
-  EXPECT_EQ(Sent(), (std::vector<std::string>{"worker_create music", "index_resume fileindex_music",
-                                              "MonitorQueueUpsert"}));
-  EXPECT_EQ(Paused(), (std::vector<bool>{false, false, false}));
-  Json::Value config = env_.MonitorQueues()[env_.QueuePath("music")]["config"];
-  ASSERT_EQ(config.size(), 2u);
-  EXPECT_EQ(config[0]["path"], env_.Volume() + "/music/a");
-  EXPECT_EQ(config[1]["path"], env_.Volume() + "/music/b");
-
-  // Resume is the mirror image: a failing monitor update means the daemon
-  // never got its worker back.
-  SharePause("music");
-  Reset();
-  env_.platform().FailCall("MonitorQueueUpsert", EIO);
-  EXPECT_EQ(Thrown([] { ShareResume("music"); }), "502 MonitorQueue::Upsert failed, share=music");
   EXPECT_EQ(Sent(),
-            (std::vector<std::string>{"index_resume fileindex_music", "MonitorQueueUpsert"}));
-  EXPECT_EQ(Paused(), (std::vector<bool>{true, false, true}));
+            (Strings{"worker_create music", "index_resume fileindex_music", "MonitorQueueUpsert"}));
+  EXPECT_EQ(Paused(), "0 0 0");
+  MarkFoldersFile();
+  for (const char* share : {"mus", "photo"}) SharePause(share);
+  EXPECT_FALSE(FoldersFileSaved());
+  EXPECT_EQ(Events("music").size(), 2u) << "the queue is never touched";
 }
 
-TEST_F(ShareOpsTest, PausingAPausedShareRepeatsEveryStep) {
-  SharePause("music");
-  Reset();
-  SharePause("music");
-  EXPECT_EQ(Sent(), (std::vector<std::string>{"worker_delete music", "index_pause fileindex_music",
-                                              "MonitorQueueDelete"}));
-  EXPECT_EQ(Paused(), (std::vector<bool>{true, false, true}));
-}
-
-TEST_F(ShareOpsTest, ASharesWithoutFoldersOrWithoutANameAreLeftAlone) {
-  env_.MarkFoldersFile();
+// A failure at each step shows which steps came before it; calling again
+// completes the pause. A failed resume never gives the daemon its worker.
+TEST_F(ShareOpsTest, AFailedPauseOrResumeLeavesTheStepsBeforeItDone) {
+  Given({"/music/a", "/music2/c", "/music/b"});
   struct Case {
-    const char* what;
-    std::function<void()> op;
-    std::string error;
+    std::function<void()> inject;
+    Strings sent;
   } cases[] = {
-      {"pause of an unindexed share", [] { SharePause("photo"); }, "no error"},
-      {"resume of an unindexed share", [] { ShareResume("photo"); }, "no error"},
-      {"pause of a share that does not exist", [] { SharePause("nosuch"); }, "no error"},
-      {"pause of a prefix of a share", [] { SharePause("mus"); }, "no error"},
-      {"pause without a name", [] { SharePause(""); }, "120 Missing share name"},
-      {"resume without a name", [] { ShareResume(""); }, "120 Missing share name"},
-      {"clean-up without a name", [] { ShareClearPaused("", "/volume1/music"); },
-       "120 Missing share name"},
-      {"clean-up without a path", [] { ShareClearPaused("music", ""); }, "120 Missing share path"},
-      {"migrate without a name", [] { ShareMigrate("", "/volume9/music"); },
-       "120 Missing share name"},
-      {"migrate without the old path", [] { ShareMigrate("music", ""); }, "120 Missing share path"},
-      {"migrate of an unindexed share", [] { ShareMigrate("photo", "/volume9/photo"); },
-       "no error"},
+      {[&] { daemon_.SetAnswerBytes(""), daemon_.SetCloseAfterAnswer(true); },
+       {"worker_delete music"}},
+      {[&] { platform_.FailCall("MonitorQueueDelete", EIO); },
+       {"worker_delete music", "MonitorQueueDelete"}},
+      {[&] { search_.Push(FakeSearchDaemon::Failure(77, "no")); }, kPauseSteps},
   };
   for (const Case& c : cases) {
-    EXPECT_EQ(Thrown(c.op), c.error) << c.what;
-    EXPECT_EQ(Sent(), std::vector<std::string>{}) << c.what;
-    EXPECT_FALSE(env_.FoldersFileSaved()) << c.what;
+    ForgetSent();
+    c.inject();
+    EXPECT_NE(Thrown([] { SharePause("music"); }), "no error") << c.sent.back();
+    EXPECT_EQ(Sent(), c.sent);
+    EXPECT_EQ(Paused(), "0 0 0") << c.sent.back() << ": list saved";
+    daemon_.SetAnswerBytes(std::string("\x10\0\0\0{\"success\":true}", 20));
+    daemon_.SetCloseAfterAnswer(false);
+    platform_.ClearFailures();
   }
-  EXPECT_TRUE(env_.platform().ServiceCalls().empty());
-  EXPECT_TRUE(env_.platform().Execs().empty());
+  SharePause("music");
+  ForgetSent();
+  platform_.FailCall("MonitorQueueUpsert", EIO);
+  EXPECT_EQ(Thrown([] { ShareResume("music"); }), "502 MonitorQueue::Upsert failed, share=music");
+  EXPECT_EQ(Sent(), (Strings{"index_resume fileindex_music", "MonitorQueueUpsert"}));
+  EXPECT_EQ(Paused(), "1 0 1");
 }
 
 TEST_F(ShareOpsTest, ClearingAShareRemovesItsDataIndexFoldersAndStatus) {
+  Given({"/music/a", "/music2/c", "/music/b"});
   StatusMgr().SetShareStatus("music", kShareStatusNeedReindex);
   StatusMgr().SetShareStatus("music2", kShareStatusNeedReindex);
-  const std::string share_path = env_.Volume() + "/music";
-  ShareClearPaused("music", share_path);
-
-  std::vector<std::string> removed;
-  for (const auto& exec : env_.platform().Execs()) {
-    EXPECT_EQ(exec.program, "/bin/rm");
-    ASSERT_EQ(exec.args.size(), 2u);
-    EXPECT_EQ(exec.args[0], "-rf");
-    removed.push_back(exec.args[1]);
+  platform_.SetExecResult(0, true);  // really remove
+  const std::string data = Volume() + "/@fileindex/music";
+  for (const char* file : {"/queue.tmp", "/db/segment", "/keep"}) {
+    testing::WriteFile(data + file, "x");
   }
-  const std::string data = env_.Volume() + "/@fileindex/music";
-  EXPECT_EQ(removed,
-            (std::vector<std::string>{data + "/queue", data + "/queue.tmp", data + "/db"}));
-  EXPECT_EQ(Sent(), std::vector<std::string>{"index_delete fileindex_music"});
-  EXPECT_EQ(env_.FolderPaths(), std::vector<std::string>{"/music2/c"});
-  EXPECT_EQ(StatusMgr().GetShareStatus("music"), 0);
-  EXPECT_EQ(StatusMgr().GetShareStatus("music2"), kShareStatusNeedReindex);
-  EXPECT_TRUE(env_.platform().ServiceCalls().empty()) << "folders are left";
-
-  // The last share: the services stop.
-  ShareClearPaused("music2", env_.Volume() + "/music2");
-  EXPECT_TRUE(env_.FolderPaths().empty());
-  EXPECT_EQ(env_.platform().ServiceCalls(), testing::ServicesStoppedCalls());
+  ShareClearPaused("music", Volume() + "/music");
+  for (const char* gone : {"/queue", "/queue.tmp", "/db"}) {
+    EXPECT_NE(access((data + gone).c_str(), F_OK), 0) << gone;
+  }
+  EXPECT_EQ(access((data + "/keep").c_str(), F_OK), 0);
+  EXPECT_EQ(Sent(), Strings{"index_delete fileindex_music"});
+  EXPECT_EQ(FolderPaths(), Strings{"/music2/c"});
+  EXPECT_EQ(
+      std::make_pair(StatusMgr().GetShareStatus("music"), StatusMgr().GetShareStatus("music2")),
+      std::make_pair(0, kShareStatusNeedReindex));
+  EXPECT_TRUE(platform_.ServiceCalls().empty()) << "folders are left";
+  ShareClearPaused("music2", Volume() + "/music2");  // the last share: the services stop
+  EXPECT_EQ(platform_.ServiceCalls(), testing::ServicesStoppedCalls());
 }
 
-TEST_F(ShareOpsTest, AShareGoneFromThePlatformIsClearedAllTheSame) {
-  env_.platform().RemoveShare("music");
-  EXPECT_EQ(Thrown([] { FolderDelete("/music/a"); }).substr(0, 4), "800 ");
-  ShareClearPaused("music", env_.Volume() + "/music");
-  EXPECT_EQ(env_.FolderPaths(), std::vector<std::string>{"/music2/c"});
-  EXPECT_EQ(Sent(), std::vector<std::string>{"index_delete fileindex_music"});
-}
-
-TEST_F(ShareOpsTest, AClearThatCannotComposeItsPathsStopsThere) {
-  const std::string share_path = env_.Volume() + "/music";
-  env_.platform().FailCall("FILEIDXDBPathCompose", EINVAL, share_path);
-  EXPECT_EQ(Thrown([&] { ShareClearPaused("music", share_path); }),
-            "502 FILEIDXDBPathCompose failed, share_path=" + share_path);
-  EXPECT_EQ(env_.platform().Execs().size(), 2u) << "the queues are removed already";
-  EXPECT_EQ(Sent(), std::vector<std::string>{});
-  EXPECT_EQ(env_.FolderPaths().size(), 3u);
-}
-
+// The share now lives on volume2; the platform reports its new path.
 TEST_F(ShareOpsTest, MigrationMovesTheIndexAndTheMonitorAndQueuesTheMove) {
-  // The share now lives on volume2; the platform reports its new path.
-  const std::string old_path = env_.Volume() + "/music";
-  const std::string new_path = env_.AddShare("music", "volume2");
-  MakeDirs(new_path + "/a");
-  MakeDirs(new_path + "/b");
-  const Json::Value monitor_before = env_.MonitorQueues();
-  const std::string old_queue = env_.Volume() + "/@fileindex/music/queue";
-  ASSERT_TRUE(monitor_before.isMember(old_queue));
-
+  Given({"/music/a", "/music2/c", "/music/b"});
+  const std::string old_path = Volume() + "/music", old_queue = QueuePath("music");
+  const std::string new_path = AddShare("music", {"/a", "/b"}, "volume2");
   ShareMigrate("music", old_path);
-  EXPECT_EQ(Sent(), (std::vector<std::string>{"worker_delete music", "worker_create music",
-                                              "index_config_set fileindex_music",
-                                              "MonitorQueueDelete", "MonitorQueueUpsert"}));
-  const Json::Value migrate = env_.search().Requests().back();
-  EXPECT_EQ(migrate["data"]["data"]["path"], env_.Volume("volume2") + "/@fileindex/music/db")
-      << migrate;
-  Json::Value monitor = env_.MonitorQueues();
-  EXPECT_FALSE(monitor.isMember(old_queue));
-  Json::Value config = monitor[env_.QueuePath("music")]["config"];
-  ASSERT_EQ(config.size(), 2u) << monitor;
-  EXPECT_EQ(config[0]["path"], new_path + "/a");
+  EXPECT_EQ(Sent(), (Strings{"worker_delete music", "worker_create music",
+                             "index_config_set fileindex_music", "MonitorQueueDelete",
+                             "MonitorQueueUpsert"}));
+  EXPECT_EQ(search_.Requests().back()["data"]["data"]["path"],
+            Volume("volume2") + "/@fileindex/music/db");
+  EXPECT_FALSE(MonitorQueues().isMember(old_queue));
+  EXPECT_EQ(MonitorPaths("music")[0], new_path + "/a");
+  EXPECT_EQ(Events("music"), (Strings{"256 /music <- /music", "65536 /music/a", "65536 /music/b"}));
+  EXPECT_NE(testing::ReadFile(QueuePath("music")).find(R"("path_old":")" + old_path + "\""),
+            std::string::npos);
+}
 
-  std::vector<Json::Value> events = env_.QueueEvents("music");
-  ASSERT_EQ(events.size(), 3u);
-  EXPECT_EQ(events[0]["event"], 0x100);
-  EXPECT_EQ(events[0]["path"], new_path);
-  EXPECT_EQ(events[0]["path_old"], old_path);
-  EXPECT_EQ(events[1]["event"], 0x10000);
-  EXPECT_EQ(events[1]["path"], new_path + "/a");
-  EXPECT_EQ(events[2]["path"], new_path + "/b");
+// A folder paused before the volume is resumed with it; a clear removes the
+// shares that the pause marked but keeps their indexes, and stops the
+// services with the last folder.
+TEST_F(ShareOpsTest, AVolumeIsPausedResumedAndClearedShareByShare) {
+  Given({"/photo/a", "/video/v", "/photo/b", "/music/a"});
+  StatusMgr().SetShareStatus("photo", kShareStatusNeedReindex);
+  SharePause("music");
+  ForgetSent();
+  VolumePause(v1_);
+  EXPECT_EQ(Paused(), "1/volume1 0 1/volume1 1/volume1");
+  EXPECT_EQ(Sent(),
+            (Strings{"worker_delete music", "worker_delete photo", "index_pause fileindex_music",
+                     "index_pause fileindex_photo", "MonitorQueueDelete", "MonitorQueueDelete"}));
+  VolumeResume(v1_);
+  EXPECT_EQ(Paused(), "0/volume1 0 0/volume1 0/volume1");
+  EXPECT_EQ(MonitorPaths("photo").size(), 2u);
+  VolumePause(v1_);
+  ForgetSent();
+  VolumeClearPaused(v1_);
+  EXPECT_EQ(FolderPaths(), Strings{"/video/v"});
+  EXPECT_EQ(StatusMgr().GetShareStatus("photo"), 0);
+  EXPECT_EQ(Sent(), Strings{});
+  EXPECT_TRUE(platform_.ServiceCalls().empty()) << "a folder is left";
+  VolumePause(Volume("volume10"));
+  VolumeClearPaused(Volume("volume10"));
+  EXPECT_EQ(platform_.ServiceCalls(), testing::ServicesStoppedCalls());
+}
+
+// /homes/alice2 is not in alice's home.
+TEST_F(ShareOpsTest, UserRenameMovesTheHomeAndWhatIsInsideItOnly) {
+  AddShare("homes", {"/alice/docs", "/alice2/docs"});
+  Given({"/homes/alice/docs", "/homes/alice", "/homes/alice2/docs"});
+  UserRename("alice", "bob");
+  EXPECT_EQ(FolderPaths(), (Strings{"/homes/bob/docs", "/homes/bob", "/homes/alice2/docs"}));
+  EXPECT_EQ(LogCount("Update homes rule: [/homes/alice/docs] -> [/homes/bob/docs]"), 1u);
+  EXPECT_EQ(LogCount("Update homes rule: ["), 2u);
+  EXPECT_EQ(Events("homes").back(), "256 /homes/bob <- /homes/alice");
+}
+
+// The share has been renamed on the platform before the hook runs.
+TEST_F(ShareOpsTest, ShareRenameMovesTheSharesFoldersIndexAndDocuments) {
+  Given({"/music/a", "/music2/c", "/music/b"});
+  ASSERT_EQ(rename((Volume() + "/music").c_str(), (Volume() + "/tunes").c_str()), 0);
+  platform_.RemoveShare("music");
+  AddShare("tunes");
+  ShareRename("music", "tunes");
+  EXPECT_EQ(FolderPaths(), (Strings{"/tunes/a", "/music2/c", "/tunes/b"}));
+  EXPECT_EQ(Sent(), Strings{"index_config_set fileindex_music"});
+  EXPECT_EQ(search_.Requests().back()["data"]["data"],
+            testing::ParseJson(R"({"id":"fileindex_tunes","path":")" + Volume() +
+                               R"(/@fileindex/tunes/db"})"));
+  EXPECT_EQ(Events("tunes"), Strings{"256 /tunes <- /music"});
+}
+
+// Disable enumerates every home; a bin outside every share is logged and
+// the others queued; a failing enumeration queues nothing. A share's own bin
+// is queued only while the share's path is a real directory.
+TEST_F(ShareOpsTest, RecycleBinTriggersQueueOneReindexPerBinInOrder) {
+  const std::string homes = AddShare("homes"), photo = Volume() + "/photo";
+  platform_.SetHomeRecyclePaths(
+      {homes + "/bob/#recycle", "/nowhere/x/#recycle", "", homes + "/alice/#recycle"});
+  HomeEnable(sdk::kAuthLdap);
+  HomeDisable(sdk::kAuthDomain);
+  const Strings both = {"65536 /homes/bob/#recycle", "65536 /homes/alice/#recycle"};
+  EXPECT_EQ(Events("homes"), (Strings{both[0], both[1], both[0], both[1]}));
+  EXPECT_EQ(platform_.AuthTypes(), std::vector<int>{sdk::kAuthLdap});
+  EXPECT_EQ(LogCount("AddCustomEvent failed"), 2u);
+  platform_.FailCall("QORURecycleHomeEnumRecyclePathForAuthType", ENOENT);
+  platform_.FailCall("QORURecycleHomeEnumRecyclePath", ENOENT);
+  HomeEnable(sdk::kAuthLocal);
+  HomeDisable(sdk::kAuthDomain);
+  EXPECT_EQ(Events("homes").size(), 4u);
+  EXPECT_EQ(LogCount("QORURecycleHomeEnumRecyclePathForAuthType failed. auth: 1") +
+                LogCount("QORURecycleHomeEnumRecyclePath failed. auth: 2"),
+            2u);
+  ShareCheckRecycle("photo");
+  ASSERT_EQ(rename(photo.c_str(), (photo + ".old").c_str()), 0);
+  ShareCheckRecycle("photo");
+  ASSERT_EQ(symlink((photo + ".old").c_str(), photo.c_str()), 0);
+  ShareCheckRecycle("photo");
+  EXPECT_EQ(Events("photo"), Strings{"65536 /photo/#recycle"});
+  EXPECT_EQ(Thrown([] { ShareCheckRecycle("nosuch"); }).substr(0, 4), "800 ");
+}
+
+// No restart after a failed switch; the daemons are still asked for.
+TEST_F(ShareOpsTest, EveryServiceStepRunsWhateverTheOneBeforeDid) {
+  platform_.SetErrorSite("smb_conf.cpp", 42);
+  for (const char* call : {"QORUSMBSetSpotlight", "QLIBServiceStart", "QLIBServicectlStart",
+                           "QLIBServiceStop", "QLIBServicectlStop"}) {
+    platform_.FailCall(call, ENOENT);
+  }
+  SetupRelatedServices(true);
+  SetupRelatedServices(false);
+  EXPECT_EQ(platform_.ServiceCalls(),
+            (std::vector<ServiceCall>{{"QORUSMBSetSpotlight", "1"},
+                                      {"QLIBServiceStart", "qorucontentextractd"},
+                                      {"QLIBServicectlStart", "pkg-Vellis-fileindexd"},
+                                      {"QLIBServiceStop", "qorucontentextractd"},
+                                      {"QLIBServicectlStop", "pkg-Vellis-fileindexd"}}));
+  for (const char* line :
+       {"QORUSMBSetSpotlight failed: err=[0x0002 smb_conf.cpp:42]",
+        "Failed [0 > QLIBServiceStart(\"qorucontentextractd\", TRUE)]",
+        "Failed [0 > QLIBServicectlStart(\"pkg-Vellis-fileindexd\", QLIB_SERVICECTL_UPSTART)]",
+        "Failed [0 > QLIBServiceStop(\"qorucontentextractd\", FALSE)]",
+        "Failed [0 > QLIBServicectlStop(\"pkg-Vellis-fileindexd\", QLIB_SERVICECTL_UPSTART)]"}) {
+    EXPECT_EQ(LogCount(line), 1u) << line;
+  }
+  platform_.ClearFailures();  // the switch works, the restart fails
+  platform_.FailCall("QLIBServiceRestart", ENOENT);
+  SetupRelatedServices(true);
+  EXPECT_EQ(LogCount("QLIBServiceRestart failed: err="), 1u);
+}
+
+// A list that cannot be read counts as empty, and is logged.
+TEST_F(ShareOpsTest, PrepareServicesFollowsWhetherAnyFolderIsListed) {
+  PrepareServices();
+  EXPECT_EQ(platform_.ServiceCalls().back().call, "QLIBServicectlStop");
+  Given({"/music/a"});
+  PrepareServices();
+  EXPECT_EQ(platform_.ServiceCalls().back().call, "QLIBServicectlStart");
+  testing::WriteFile(RootPath(kFileIndexFoldersCfgPath), "{not json");
+  PrepareServices();
+  EXPECT_EQ(platform_.ServiceCalls().back().call, "QLIBServicectlStop");
+  EXPECT_EQ(LogCount("Cannot load folder list, code=504"), 1u);
+}
+
+// The pause of indexing as a whole is saved by root and announced.
+TEST_F(ShareOpsTest, IndexingPauseAndResumeAreSavedAndAnnounced) {
+  const std::string status_file = RootPath(kFileIndexStatusCfgPath);
+  platform_.SetTime(1700000000);
+  EXPECT_EQ(StatusMgr().GetPauseInfo(), -1) << "no file: not paused";
+  EXPECT_NE(access(status_file.c_str(), F_OK), 0) << "loading must not create the file";
+  StatusMgr().Pause(2);
+  EXPECT_EQ(StatusMgr().GetPauseInfo(), 1700007200);
+  struct stat st;
+  ASSERT_EQ(stat(status_file.c_str(), &st), 0);
+  EXPECT_EQ(st.st_mode & 07777, 0644u);
+  StatusMgr().Resume();
+  EXPECT_EQ(StatusMgr().GetPauseInfo(), -1);
+  EXPECT_EQ(daemon_.Commands(),
+            (std::vector<Json::Value>{
+                testing::ParseJson(R"({"type":"pause","data":{"resume_time":1700007200}})"),
+                testing::ParseJson(R"({"type":"resume","data":null})")}));
+  EXPECT_EQ(platform_.Resets(), (Strings{"root", "root"})) << "each save runs as root";
 }
 
 }  // namespace

@@ -1,32 +1,38 @@
+// A share's queue: rounds over the live queue and its side file, bad lines,
+// the searches for pending work, the quick "certainly not" filter, and the
+// custom events appended to it.
 #include "fileindex/queue_mgr.h"
 
 #include <gtest/gtest.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
+#include <map>
 #include <sstream>
-#include <string>
-#include <vector>
 
 #include "common/error.h"
-#include "tests/support/fake_platform.h"
-#include "tests/support/temp_root.h"
+#include "common/json_util.h"
+#include "fileindex/util.h"
+#include "fileindex/queue_path_filter.h"
+#include "fileindex/status_mgr.h"
+#include "tests/support/folder_env.h"
 
 namespace vellis::fileindex {
 namespace {
 
+using Strings = std::vector<std::string>;
+using testing::ReadFile;
+using testing::WriteFile;
+
 std::string Modify(const std::string& path) { return R"({"event":2,"path":")" + path + R"("})"; }
+const std::string kReindexA = R"({"event":65536,"path":"/v/s/a"})";
 
-bool Exists(const std::string& path) {
-  struct stat st;
-  return lstat(path.c_str(), &st) == 0;
-}
-
-class QueueMgrTest : public ::testing::Test {
+class QueueMgrTest : public testing::FolderEnvTest {
  protected:
-  // Runs one round and returns the printed forms of the delivered operations.
-  std::vector<std::string> Round(bool tmp, unsigned* count = nullptr) {
-    std::vector<std::string> got;
+  // The printed operations of one round, then "count=N".
+  Strings Round(bool tmp) {
+    Strings got;
     unsigned n = mgr_.ProcessOP(
         [&](std::shared_ptr<OP> op) {
           std::ostringstream os;
@@ -34,210 +40,219 @@ class QueueMgrTest : public ::testing::Test {
           got.push_back(os.str());
         },
         tmp);
-    if (count) *count = n;
+    got.push_back("count=" + std::to_string(n));
     return got;
   }
 
-  testing::TempRoot root_;
-  testing::FakePlatform platform_;
-  testing::ScopedPlatform scoped_{&platform_};
-  std::string queue_ = root_.Path("/share.queue");
-  std::string side_ = queue_ + ".tmp";
-  QueueMgr mgr_{queue_};
-
-  // A query over a live queue and a side file (each absent when empty).
-  struct QueryCase {
-    std::string live;
-    std::string side;
-    std::string query;
-    bool expected;
-  };
-  template <size_t N>
-  void ExpectQuery(const QueryCase (&cases)[N], bool (QueueMgr::*query)(const std::string&) const) {
-    for (const auto& c : cases) {
-      remove(queue_.c_str());
-      remove(side_.c_str());
-      if (!c.live.empty()) testing::WriteFile(queue_, c.live + "\n");
-      if (!c.side.empty()) testing::WriteFile(side_, c.side + "\n");
-      EXPECT_EQ((mgr_.*query)(c.query), c.expected)
-          << "live: " << c.live << ", side: " << c.side << ", query: " << c.query;
-    }
+  // Writes the live queue and the side file (each absent when empty).
+  void Write(const std::string& live, const std::string& side) {
+    remove(queue_.c_str());
+    remove(side_.c_str());
+    if (!live.empty()) WriteFile(queue_, live + "\n");
+    if (!side.empty()) WriteFile(side_, side + "\n");
   }
+
+  const std::string share_ = AddShare("s"), queue_ = QueuePath("s"), side_ = queue_ + ".tmp";
+  QueueMgr mgr_{queue_};
 };
 
-TEST_F(QueueMgrTest, NoQueueAndNoSideFileProcessNothing) {
-  unsigned count = 99;
-  EXPECT_TRUE(Round(true, &count).empty());
-  EXPECT_EQ(count, 0u);
-  EXPECT_TRUE(Round(false, &count).empty());
-  EXPECT_EQ(count, 0u);
-  EXPECT_FALSE(Exists(side_));
-}
-
-TEST_F(QueueMgrTest, RoundMovesTheLiveQueueAsideAndKeepsTheSideFile) {
-  const std::string text = Modify("/s/a") + "\n" + Modify("/s/b") + "\n";
-  testing::WriteFile(queue_, text);
-  unsigned count = 0;
-  EXPECT_EQ(Round(true, &count), (std::vector<std::string>{"[02] /s/a", "[02] /s/b"}));
-  EXPECT_EQ(count, 2u);
-  EXPECT_FALSE(Exists(queue_));
-  EXPECT_EQ(testing::ReadFile(side_), text);  // deleted only by the caller, after success
-  mgr_.DeleteTmp();
-  EXPECT_FALSE(Exists(side_));
-  mgr_.DeleteTmp();  // a missing side file is no error
-}
-
-TEST_F(QueueMgrTest, LeftoverSideFileGoesFirstAndTheLiveQueueWaits) {
-  testing::WriteFile(side_, Modify("/s/old") + "\n");
-  const std::string live = Modify("/s/new") + "\n";
-  testing::WriteFile(queue_, live);
-  // The first round fails half-way, as if the process had died.
+// A side file planted as a link is replaced, never followed. A round that
+// fails half-way, as if the process had died, leaves its side file to go
+// first, and the live queue waits.
+TEST_F(QueueMgrTest, RoundsMoveTheQueueAsideAndFinishALeftoverSideFileFirst) {
+  WriteFile(root_.Path("/precious"), "keep me\n");
+  ASSERT_EQ(symlink(root_.Path("/precious").c_str(), side_.c_str()), 0);
+  WriteFile(queue_, Modify("/s/old") + "\n");
   EXPECT_THROW(mgr_.ProcessOP([](std::shared_ptr<OP>) { throw Error(kErrBusy, "busy"); }, true),
                Error);
-  EXPECT_EQ(Round(true), (std::vector<std::string>{"[02] /s/old"}));
-  EXPECT_EQ(testing::ReadFile(queue_), live);
+  EXPECT_EQ(ReadFile(root_.Path("/precious")), "keep me\n");
+  WriteFile(queue_, Modify("/s/new") + "\n");
+  EXPECT_EQ(Round(true), (Strings{"[02] /s/old", "count=1"}));
+  EXPECT_EQ(ReadFile(queue_), Modify("/s/new") + "\n");
   mgr_.DeleteTmp();
-  EXPECT_EQ(Round(true), (std::vector<std::string>{"[02] /s/new"}));
-  EXPECT_FALSE(Exists(queue_));
+  EXPECT_EQ(Round(true), (Strings{"[02] /s/new", "count=1"}));
+  mgr_.DeleteTmp();
+  EXPECT_EQ(Round(true), Strings{"count=0"});
 }
 
-TEST_F(QueueMgrTest, WithoutSideFileTheLiveQueueIsReadInPlace) {
-  const std::string text = Modify("/s/a");  // the last line needs no newline
-  testing::WriteFile(queue_, text);
-  EXPECT_EQ(Round(false), (std::vector<std::string>{"[02] /s/a"}));
-  EXPECT_EQ(testing::ReadFile(queue_), text);
-  EXPECT_FALSE(Exists(side_));
-}
-
-TEST_F(QueueMgrTest, PlantedSideFileLinkIsReplacedNeverFollowed) {
-  const std::string target = root_.Path("/precious");
-  testing::WriteFile(target, "keep me\n");
-  ASSERT_EQ(symlink(target.c_str(), side_.c_str()), 0);
-  testing::WriteFile(queue_, Modify("/s/a") + "\n");
-  EXPECT_EQ(Round(true), (std::vector<std::string>{"[02] /s/a"}));
-  EXPECT_EQ(testing::ReadFile(target), "keep me\n");
-}
-
-TEST_F(QueueMgrTest, QueueThatIsNotARegularFileIsRefusedWithoutHanging) {
-  const std::string target = root_.Path("/target");
-  testing::WriteFile(target, Modify("/s/secret") + "\n");
-  struct Case {
-    const char* what;
-    void (*make)(const std::string& path, const std::string& target);
-  } cases[] = {
-      {"missing", [](const std::string&, const std::string&) {}},
-      {"symbolic link", [](const std::string& p,
-                           const std::string& t) { ASSERT_EQ(symlink(t.c_str(), p.c_str()), 0); }},
-      {"FIFO",
-       [](const std::string& p, const std::string&) { ASSERT_EQ(mkfifo(p.c_str(), 0644), 0); }},
-      {"directory", [](const std::string& p, const std::string&) { testing::MakeDirs(p); }},
-  };
-  for (const auto& c : cases) {
-    for (bool side : {false, true}) {
-      const std::string path = side ? side_ : queue_;
-      c.make(path, target);
-      try {
-        side ? mgr_.GetOPTreeTmp() : mgr_.GetOPTree();
-        ADD_FAILURE() << c.what << (side ? " side file" : " queue") << " was read";
-      } catch (const Error& e) {
-        EXPECT_EQ(e.GetCode(), kErrInternal) << c.what;
-        EXPECT_EQ(std::string(e.what()).rfind("Failed to open queue, reason=", 0), 0u)
-            << c.what << ": " << e.what();
-      }
-      // A round skips such a live queue: nothing is read through it, nothing moved.
-      if (!side) {
-        unsigned count = 99;
-        EXPECT_TRUE(Round(true, &count).empty()) << c.what;
-        EXPECT_EQ(count, 0u) << c.what;
-        EXPECT_EQ(Exists(queue_), std::string(c.what) != "missing") << c.what;
-      }
-      remove(path.c_str());
-    }
+// Nothing is read through a link, FIFO or directory, nothing hangs, and a
+// round leaves such a live queue where it is.
+TEST_F(QueueMgrTest, QueueThatIsNotARegularFileIsRefused) {
+  WriteFile(root_.Path("/target"), Modify("/s/secret") + "\n");
+  for (const std::string kind : {"link", "FIFO", "directory"}) {
+    ASSERT_EQ(kind == "link"   ? symlink(root_.Path("/target").c_str(), queue_.c_str())
+              : kind == "FIFO" ? mkfifo(queue_.c_str(), 0644)
+                               : mkdir(queue_.c_str(), 0755),
+              0);
+    EXPECT_EQ(testing::Thrown([&] { mgr_.GetOPTree(); }).substr(0, 33),
+              "502 Failed to open queue, reason=")
+        << kind;
+    EXPECT_EQ(Round(true), Strings{"count=0"}) << kind;
+    EXPECT_EQ(access(queue_.c_str(), F_OK), 0) << kind;
+    remove(queue_.c_str());
   }
-  EXPECT_EQ(testing::ReadFile(target), Modify("/s/secret") + "\n");
 }
 
 TEST_F(QueueMgrTest, BadLinesAreLoggedAndSkippedAndTheRestIsRead) {
-  const std::string mib_line = [] {
-    std::string head = R"({"event":2,"path":"/s/big","data":")";
-    return head + std::string((1u << 20) - head.size() - 2, 'x') + "\"}";
-  }();
-  ASSERT_EQ(mib_line.size(), 1u << 20);
+  const std::string head = R"({"event":2,"path":"/s/big","data":")";
+  const std::string mib_line = head + std::string((1u << 20) - head.size() - 2, 'x') + "\"}";
   struct Case {
-    const char* what;
     std::string line;
     int code;
   } cases[] = {
-      {"empty line", "", 906},
-      {"not JSON", "not json", 906},
-      {"truncated line", R"({"event":2,"pa)", 906},
-      {"line of 1 MiB", mib_line, 906},
-      {"NUL byte", std::string(R"({"event":2,"path":"/s/n)") + '\0' + R"("})", 906},
-      {"invalid UTF-8 in the path", "{\"event\":2,\"path\":\"/s/\xff\xfe\"}", 906},
-      {"overlong UTF-8 in the path", "{\"event\":2,\"path\":\"/s/\xc0\xaf\"}", 906},
-      {"deeply nested data",
-       R"({"event":2,"path":"/s/n","data":)" + std::string(2000, '[') + std::string(2000, ']') +
+      {"", 906},
+      {R"({"event":2,"pa)", 906},
+      {mib_line, 906},
+      {"{\"event\":2,\"path\":\"/s/\xff\xfe\"}", 906},
+      {R"({"event":2,"path":"/s/n","data":)" + std::string(2000, '[') + std::string(2000, ']') +
            "}",
        906},
-      {"relative path", Modify("s/a"), 9999},
-      {"doubled slash", Modify("/s//a"), 9999},
-      {"trailing slash", Modify("/s/a/"), 9999},
-      {"dot-dot component", Modify("/s/../etc"), 9999},
-      {"event of the wrong type", R"({"event":"2","path":"/s/a"})", 120},
-      {"missing path", R"({"event":2})", 120},
+      {Modify("s/a"), 9999},
+      {Modify("/s/../etc"), 9999},
+      {R"({"event":"2","path":"/s/a"})", 120},
   };
   for (const auto& c : cases) {
-    testing::WriteFile(queue_, Modify("/s/before") + "\n" + c.line + "\n" + Modify("/s/after"));
+    WriteFile(queue_, Modify("/s/before") + "\n" + c.line + "\n" + Modify("/s/after"));
     platform_.ClearLogs();
-    unsigned count = 0;
-    EXPECT_EQ(Round(false, &count), (std::vector<std::string>{"[02] /s/before", "[02] /s/after"}))
-        << c.what;
-    EXPECT_EQ(count, 2u) << c.what;
-    std::vector<std::string> failed = platform_.LogsContaining("InsertEvent failed");
-    ASSERT_EQ(failed.size(), 1u) << c.what;
+    EXPECT_EQ(Round(false), (Strings{"[02] /s/before", "[02] /s/after", "count=2"})) << c.line;
+    const Strings failed = platform_.LogsContaining("InsertEvent failed");
+    ASSERT_EQ(failed.size(), 1u) << c.line.substr(0, 40);
     EXPECT_NE(failed[0].find("code=" + std::to_string(c.code) + ","), std::string::npos)
-        << c.what << ": " << failed[0];
+        << failed[0].substr(0, 200);
+  }
+  // One byte shorter, the line is read.
+  WriteFile(queue_, mib_line.substr(0, mib_line.size() - 3) + "\"}\n");
+  EXPECT_EQ(Round(false), (Strings{"[02] /s/big", "count=1"}));
+}
+
+// A reindex on the path or an ancestor, by whole components.
+TEST_F(QueueMgrTest, FindsAReindexOnThePathOrAnAncestorOnly) {
+  struct Case {
+    std::string live, side, query;
+    bool found;
+  } cases[] = {
+      {kReindexA, "", "/v/s/a/b", true},
+      {kReindexA, "", "/v/s/a", true},
+      {kReindexA, "", "/v/s", false},
+      {kReindexA, "", "/v/s/ab", false},
+      {R"({"event":65538,"path":"/v/s/a"})", "", "/v/s/a/b", false},
+      {R"({"event":65536,"path":"/v/s/ab"})", "", "/v/s/a", false},
+      {"not json\n" + Modify("/v/s/a"), R"({"event":65536,"path":"/v"})", "/v/s/a/b", true},
+      {"", "", "/v/s/a", false},
+  };
+  for (const auto& c : cases) {
+    Write(c.live, c.side);
+    EXPECT_EQ(mgr_.IsFullPathHasReindex(c.query), c.found) << c.live << c.side << c.query;
   }
 }
 
-TEST_F(QueueMgrTest, LineJustUnderOneMebibyteIsRead) {
-  std::string head = R"({"event":2,"path":"/s/big","data":")";
-  std::string line = head + std::string((1u << 20) - 1 - head.size() - 2, 'x') + "\"}";
-  ASSERT_EQ(line.size(), (1u << 20) - 1);
-  testing::WriteFile(queue_, line + "\n" + Modify("/s/after") + "\n");
-  EXPECT_EQ(Round(false), (std::vector<std::string>{"[02] /s/big", "[02] /s/after"}));
-}
-
-TEST_F(QueueMgrTest, FindsAReindexOnThePathOrAnAncestorOnly) {
-  const QueryCase cases[] = {
-      {R"({"event":65536,"path":"/volume1/s/a"})", "", "/volume1/s/a/b", true},
-      {R"({"event":65536,"path":"/volume1/s/a"})", "", "/volume1/s/a", true},
-      {R"({"event":65536,"path":"/volume1/s/a"})", "", "/volume1/s", false},
-      {R"({"event":65538,"path":"/volume1/s/a"})", "", "/volume1/s/a/b", false},
-      {R"({"event":196608,"path":"/volume1/s/a"})", "", "/volume1/s/a/b", false},
-      {R"({"event":65536,"path":"/volume1/s/ab"})", "", "/volume1/s/a", false},
-      {R"({"event":65536,"path":"/volume1/s/a"})", "", "/volume1/s/ab", false},
-      {"not json\n" + Modify("/volume1/s/a"), R"({"event":65536,"path":"/volume1"})",
-       "/volume1/s/a/b", true},
-      {"", "", "/volume1/s/a", false},
-  };
-  ExpectQuery(cases, &QueueMgr::IsFullPathHasReindex);
-}
-
+// Pending work at or below a path, by whole components; the filter never
+// says no where the search finds work.
 TEST_F(QueueMgrTest, FindsPendingWorkAtOrBelowAPathByWholeComponents) {
-  const QueryCase cases[] = {
-      {Modify("/volume1/s/ab"), "", "/volume1/s/a", false},
-      {Modify("/volume1/s/a"), "", "/volume1/s/a", true},
-      {Modify("/volume1/s/a/x"), "", "/volume1/s/a", true},
-      {Modify("/volume1/s"), "", "/volume1/s/a", false},
-      {R"({"event":256,"path":"/volume1/t/y","path_old":"/volume1/s/a/y"})", "", "/volume1/s/a",
-       true},
-      {R"({"event":256,"path":"/volume1/t/y","path_old":"/volume1/s/ab"})", "", "/volume1/s/a",
-       false},
-      {"not json", Modify("/volume1/s/a/z"), "/volume1/s/a", true},
-      {"not json", "", "/volume1/s/a", false},
+  const std::string rename = R"({"event":256,"path":"/v/t/y","path_old":"/v/s/a/y"})";
+  struct Case {
+    std::string live, side;
+    bool found;
+  } cases[] = {
+      {Modify("/v/s/ab"), "", false},
+      {Modify("/v/s/a"), "", true},
+      {Modify("/v/s/a/x"), "", true},
+      {Modify("/v/s"), "", false},
+      {rename, "", true},
+      {R"({"event":256,"path":"/v/t/y","path_old":"/v/s/ab"})", "", false},
+      {"not json", Modify("/v/s/a/z"), true},
+      {R"({"event":2,"path":"\/v\/s\/a\/esc"})", "", true},
+      {R"({"event": 64 , "path" : "/v/s/a/spaced" })", "", true},
+      {"not json /v/s/a", "", false},
   };
-  ExpectQuery(cases, &QueueMgr::IsFullPathProcessing);
+  for (const auto& c : cases) {
+    Write(c.live, c.side);
+    EXPECT_EQ(mgr_.IsFullPathProcessing("/v/s/a"), c.found) << c.live << c.side;
+    EXPECT_TRUE(!c.found || QueueMayHoldPath(queue_, "/v/s/a") || QueueMayHoldPath(side_, "/v/s/a"))
+        << c.live << c.side;
+  }
+  Write(Modify("/v/s/a/file.txt") + "\n" + rename, "");
+  for (const char* none : {"/v/s/ab", "/v/s/a/file", "/w", "/v/s/a/y/z"}) {
+    EXPECT_FALSE(QueueMayHoldPath(queue_, none)) << none;
+  }
+}
+
+// The filter's pass is shared while the file stays the same; a changed or
+// rotated file is read again.
+TEST_F(QueueMgrTest, FilterSeesAppendedLinesAndARotatedQueue) {
+  WriteFile(queue_, Modify("/v/s/a/f") + "\n");
+  EXPECT_TRUE(QueueMayHoldPath(queue_, "/v/s/a"));
+  EXPECT_FALSE(QueueMayHoldPath(queue_, "/v/s/b"));
+  WriteFile(queue_, Modify("/v/s/a/f") + "\n" + Modify("/v/s/b/g") + "\n");
+  EXPECT_TRUE(QueueMayHoldPath(queue_, "/v/s/b"));
+  ASSERT_EQ(rename(queue_.c_str(), side_.c_str()), 0);
+  WriteFile(queue_, Modify("/v/s/c/h") + "\n");
+  EXPECT_FALSE(QueueMayHoldPath(queue_, "/v/s/b"));
+  EXPECT_TRUE(QueueMayHoldPath(side_, "/v/s/b"));
+  // Absent, or not a regular file: nothing, as the search says.
+  ASSERT_EQ(rename(queue_.c_str(), root_.Path("/elsewhere").c_str()), 0);
+  EXPECT_FALSE(QueueMayHoldPath(queue_, "/v/s/c"));
+  ASSERT_EQ(symlink(root_.Path("/elsewhere").c_str(), queue_.c_str()), 0);
+  EXPECT_FALSE(QueueMayHoldPath(queue_, "/v/s/c"));
+}
+
+// A share the platform does not know, or a queue that is a link: logged
+// and the share flagged; a path under no share is only logged.
+TEST_F(QueueMgrTest, AFailedEventIsLoggedAndFlagsItsShare) {
+  WriteFile(root_.Path("/target"), "kept\n");
+  ASSERT_EQ(symlink(root_.Path("/target").c_str(), queue_.c_str()), 0);
+  AddCustomEvent(0x10000, Volume() + "/nosuch/a", "", Json::Value());
+  EXPECT_EQ(access(StatusFile().c_str(), F_OK), -1) << "nothing to flag";
+  AddCustomEvent(0x10000, share_ + "/a", "", Json::Value());
+  platform_.FailCall("QORUShareGet", ENOENT, "s");
+  AddCustomEvent(0x10000, share_ + "/b", "", Json::Value());
+  EXPECT_EQ(ReadFile(root_.Path("/target")), "kept\n");
+  EXPECT_EQ(platform_.LogsContaining("AddCustomEvent failed, code=502").size(), 2u);
+  EXPECT_EQ(platform_.LogsContaining("AddCustomEvent failed, code=800").size(), 1u);
+  EXPECT_EQ(StatusMgr().GetShareStatus("s"), kShareStatusNeedReindex);
+}
+
+// Writers in separate processes append while the queue is rotated over and
+// over; every line turns up exactly once, whole.
+TEST_F(QueueMgrTest, ParallelAppendersRacingTheRotationLoseAndTearNothing) {
+  constexpr int kWriters = 4, kEventsEach = 200;
+  platform_.SetUSleepDivisor(100);  // lock retries after 0 to 9 ms
+  std::vector<pid_t> writers;
+  for (int w = 0; w < kWriters; ++w) {
+    pid_t pid = fork();
+    if (pid == 0) {
+      for (int i = 0; i < kEventsEach; ++i) {
+        AddCustomEvent(0x10000, share_ + "/w" + std::to_string(w) + "/" + std::to_string(i), "",
+                       Json::Value(i));
+      }
+      _exit(0);
+    }
+    writers.push_back(pid);
+  }
+  std::string collected;
+  int rounds_with_lines = 0;
+  for (bool running = true;;) {  // and one round after the last writer is done
+    mgr_.PrepareTmpQueue();
+    const std::string side = ReadFile(side_);
+    rounds_with_lines += !side.empty();
+    collected += side;
+    mgr_.DeleteTmp();
+    if (!running) break;
+    platform_.target()->USleep(2000);
+    running = false;
+    for (pid_t pid : writers) running = running || waitpid(pid, nullptr, WNOHANG) == 0;
+  }
+  std::map<std::string, int> seen;
+  std::istringstream in(collected + ReadFile(queue_));
+  for (std::string line; std::getline(in, line);) {
+    Json::Value v;
+    ASSERT_TRUE(JsonFromString(v, line)) << "torn line: " << line;
+    ++seen[v["path"].asString()];
+  }
+  EXPECT_EQ(seen.size(), static_cast<size_t>(kWriters * kEventsEach));
+  for (const auto& [path, count] : seen) EXPECT_EQ(count, 1) << path;
+  EXPECT_GE(rounds_with_lines, 2) << "the queue was never rotated while writers ran";
+  EXPECT_EQ(StatusMgr().GetShareStatus("s"), 0) << "a writer failed and flagged the share";
 }
 
 }  // namespace

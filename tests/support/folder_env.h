@@ -1,27 +1,23 @@
-// A temporary root with scripted shares, for tests of the folder
-// configuration, folder status and custom events.
+// The base fixture of the folder and queue tests: a temporary root with
+// scripted shares in "<root>/volume1", their queues in "@fileindex/<share>".
 #pragma once
 
-#include <json/json.h>
+#include <gtest/gtest.h>
 
 #include <atomic>
 #include <cstdint>
-#include <functional>
 #include <memory>
 #include <string>
 
 #include "fileindex/folder.h"
 #include "tests/support/fake_share_platform.h"
-#include "tests/support/parse_json.h"
 #include "tests/support/temp_root.h"
 #include "tests/support/thrown.h"
 
 namespace vellis::testing {
 
-// FakeSharePlatform whose sleeps really wait (on the real platform), for
-// tests in which several processes contend for a lock file. USleep waits
-// the asked time divided by SetUSleepDivisor (1 unless set), so that many
-// contending processes retry quickly.
+// FakeSharePlatform whose sleeps really wait, for processes that contend for
+// a lock file; USleep waits the time asked divided by SetUSleepDivisor.
 class SleepingSharePlatform : public FakeSharePlatform {
  public:
   void Sleep(unsigned int seconds) override { target()->Sleep(seconds); }
@@ -32,38 +28,39 @@ class SleepingSharePlatform : public FakeSharePlatform {
   std::atomic<uint64_t> divisor_{1};
 };
 
-// Owns a TempRoot and installs a SleepingSharePlatform for its lifetime.
-// Shares live in "<root>/volume1"; their queues are where the platform
-// composes them ("<root>/volume1/@fileindex/<share>/queue").
-class FolderEnv {
- public:
-  FolderEnv();
-
-  // Registers share `name` at "<root>/volume1/<name>", creates its folder
-  // and its queue's folder, and returns the share's full path.
-  std::string AddShare(const std::string& name);
-
-  // "<root>/volume1": the volume part of every full path.
+class FolderEnvTest : public ::testing::Test {
+ protected:
+  // Registers share `name` at "<root>/volume1/<name>"; returns that path.
+  std::string AddShare(const std::string& name) {
+    sdk::ShareInfo share;
+    share.szName = name;
+    share.szPath = Volume() + "/" + name;
+    MakeDirs(share.szPath);
+    MakeDirs(Volume() + "/@fileindex/" + name);
+    platform_.AddShare(share);
+    return share.szPath;
+  }
   std::string Volume() const { return root_.Path("/volume1"); }
-  // The folders file and the status file under the root.
-  std::string FoldersFile() const;
-  std::string StatusFile() const;
-  // The live queue of share `name`.
-  std::string QueuePath(const std::string& name) const;
+  std::string FoldersFile() const {
+    return root_.Path("/var/packages/Vellis/etc/fileindex.folders");
+  }
+  std::string StatusFile() const { return root_.Path("/var/packages/Vellis/etc/fileindex.status"); }
+  std::string QueuePath(const std::string& name) const {
+    return Volume() + "/@fileindex/" + name + "/queue";
+  }
 
-  SleepingSharePlatform& platform() { return platform_; }
-  const TempRoot& root() const { return root_; }
-
- private:
   TempRoot root_;
   SleepingSharePlatform platform_;
-  ScopedPlatform scoped_;
+  ScopedPlatform scoped_{&platform_};
 };
 
 // A folder record with privileged and paused off.
-std::shared_ptr<fileindex::Folder> MakeFolder(const std::string& path,
-                                              const std::string& name = "n", bool document = true,
-                                              bool audio = true, bool video = true,
-                                              bool photo = true);
+inline std::shared_ptr<fileindex::Folder> MakeFolder(const std::string& path,
+                                                     const std::string& name = "n",
+                                                     bool document = true, bool audio = true,
+                                                     bool video = true, bool photo = true) {
+  return std::make_shared<fileindex::Folder>(path, name, document, audio, video, photo, false,
+                                             false);
+}
 
 }  // namespace vellis::testing

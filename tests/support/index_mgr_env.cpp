@@ -1,151 +1,138 @@
 #include "tests/support/index_mgr_env.h"
 
-#include <sys/stat.h>
-
 #include <fstream>
-#include <sstream>
 
 #include "common/json_util.h"
 #include "common/root_path.h"
 #include "fileindex/elastic/comm.h"
 #include "fileindex/elastic/communication.h"
-#include "fileindex/folder_mgr.h"
+#include "fileindex/index_mgr.h"
 #include "sdk/linux/monitor_queues.h"
+#include "sdk/share.h"
 
 namespace vellis::testing {
 
-IndexMgrEnv::IndexMgrEnv()
-    : platform_(std::make_unique<FakeServicesPlatform>()),
-      scoped_(std::make_unique<ScopedPlatform>(platform_.get())),
-      search_(std::make_unique<FakeSearchDaemon>(RootPath(kElasticSocketPath))),
-      daemon_(std::make_unique<FakeIndexDaemon>(RootPath(fileindex::kFileIndexDaemonSocketPath))) {}
+IndexMgrTest::IndexMgrTest()
+    : search_(RootPath(kElasticSocketPath)),
+      daemon_(RootPath(fileindex::kFileIndexDaemonSocketPath)) {}
 
-IndexMgrEnv::~IndexMgrEnv() {
-  daemon_.reset();
-  search_.reset();
-  scoped_.reset();
-}
-
-std::string IndexMgrEnv::AddShare(const std::string& name, const std::string& volume) {
+std::string IndexMgrTest::AddShare(const std::string& name, const Strings& dirs,
+                                   const std::string& volume) {
   sdk::ShareInfo share;
   share.szName = name;
   share.szPath = Volume(volume) + "/" + name;
-  MakeDirs(share.szPath);
   MakeDirs(Volume(volume) + "/@fileindex/" + name);
-  platform_->AddShare(share);
-  share_volumes_[name] = volume;
+  MakeDirs(share.szPath);
+  for (const std::string& dir : dirs) MakeDirs(share.szPath + dir);
+  platform_.AddShare(share);
   return share.szPath;
 }
 
-std::string IndexMgrEnv::Volume(const std::string& volume) const {
-  return root_.Path("/" + volume);
+std::string IndexMgrTest::QueuePath(const std::string& name) const {
+  return sdk::SDKShare(name).GetQueuePath();
 }
 
-std::string IndexMgrEnv::QueuePath(const std::string& name) const {
-  auto it = share_volumes_.find(name);
-  std::string volume = it == share_volumes_.end() ? "volume1" : it->second;
-  return Volume(volume) + "/@fileindex/" + name + "/queue";
-}
-
-std::vector<Json::Value> IndexMgrEnv::QueueEvents(const std::string& name) const {
-  std::vector<Json::Value> events;
+Strings IndexMgrTest::Events(const std::string& name) const {
+  Strings events;
   std::ifstream in(QueuePath(name));
   for (std::string line; std::getline(in, line);) {
-    Json::Value v;
-    if (!JsonFromString(v, line)) v = Json::Value("unparsable: " + line);
-    events.push_back(v);
+    Json::Value e;
+    EXPECT_TRUE(JsonFromString(e, line)) << line;
+    auto cut = [&](const Json::Value& p) {
+      const std::string s = p.asString();
+      return s.rfind(root_.path(), 0) == 0 ? s.substr(s.find('/', root_.path().size() + 1)) : s;
+    };
+    events.push_back(e["event"].asString() + " " + cut(e["path"]) +
+                     (e["path_old"].asString().empty() ? "" : " <- " + cut(e["path_old"])) +
+                     (e["data"].isNull() ? "" : " " + JsonToString(e["data"])));
   }
   return events;
 }
 
-Json::Value IndexMgrEnv::FolderJson(const std::string& path, bool document, bool audio, bool video,
-                                    bool photo) {
+Json::Value IndexMgrTest::FolderJson(const std::string& path, bool document, bool audio, bool video,
+                                     bool photo) {
   Json::Value f(Json::objectValue);
   f["path"] = path;
   f["name"] = path.substr(path.rfind('/') + 1);
-  f["document"] = document;
-  f["audio"] = audio;
-  f["video"] = video;
-  f["photo"] = photo;
+  const char* keys[] = {"document", "audio", "video", "photo"};
+  const bool flags[] = {document, audio, video, photo};
+  for (int i = 0; i < 4; ++i) f[keys[i]] = flags[i];
   return f;
 }
 
-Json::Value IndexMgrEnv::FoldersFile() const {
-  Json::Value v;
-  if (!JsonFromFile(v, RootPath(fileindex::kFileIndexFoldersCfgPath))) {
-    return Json::Value();
-  }
-  return v;
+Json::Value IndexMgrTest::List(const std::vector<Json::Value>& folders) {
+  Json::Value list(Json::arrayValue);
+  for (const Json::Value& f : folders) list.append(f);
+  return list;
 }
 
-std::vector<std::string> IndexMgrEnv::FolderPaths() const {
-  std::vector<std::string> paths;
+Json::Value IndexMgrTest::List(const Strings& paths) {
+  Json::Value list(Json::arrayValue);
+  for (const std::string& p : paths) list.append(FolderJson(p));
+  return list;
+}
+
+void IndexMgrTest::Given(const Strings& paths) {
+  fileindex::FolderAdd(List(paths), false);
+  ForgetSent();
+}
+
+Json::Value IndexMgrTest::FoldersFile() const {
+  Json::Value v;
+  return JsonFromFile(v, RootPath(fileindex::kFileIndexFoldersCfgPath)) ? v : Json::Value();
+}
+
+Strings IndexMgrTest::FolderPaths() const {
+  Strings paths;
   for (const Json::Value& f : FoldersFile()) paths.push_back(f["path"].asString());
   return paths;
 }
 
-void IndexMgrEnv::MarkFoldersFile() const {
-  WriteFile(RootPath(fileindex::kFileIndexFoldersCfgPath),
-            " " + JsonToString(FoldersFile()) + "\n");
+void IndexMgrTest::MarkFoldersFile() const {
+  WriteFile(RootPath(fileindex::kFileIndexFoldersCfgPath), " " + JsonToString(FoldersFile()));
 }
 
-bool IndexMgrEnv::FoldersFileSaved() const {
-  std::string text = ReadFile(RootPath(fileindex::kFileIndexFoldersCfgPath));
-  return text.empty() || text[0] != ' ';
+bool IndexMgrTest::FoldersFileSaved() const {
+  return ReadFile(RootPath(fileindex::kFileIndexFoldersCfgPath)).rfind(" ", 0) != 0;
 }
 
-Json::Value IndexMgrEnv::MonitorQueues() const {
+Json::Value IndexMgrTest::MonitorQueues() const {
   Json::Value v;
-  if (!JsonFromFile(v, sdk::MonitorQueueFile("fileindex"))) return Json::Value();
-  return v["queues"];
+  return JsonFromFile(v, sdk::MonitorQueueFile("fileindex")) ? v["queues"] : Json::Value();
 }
 
-std::vector<std::string> IndexMgrEnv::SearchCommands() const {
-  std::vector<std::string> out;
-  for (const Json::Value& r : search_->Requests()) {
-    out.push_back(r["command"].asString() + " " + r["data"]["id"].asString());
+Json::Value IndexMgrTest::MonitorPaths(const std::string& name) const {
+  const Json::Value queues = MonitorQueues();
+  Json::Value paths(Json::arrayValue);
+  for (const Json::Value& c : queues[QueuePath(name)]["config"]) paths.append(c["path"]);
+  return paths;
+}
+
+Strings IndexMgrTest::Sent() const {
+  Strings out;
+  const std::vector<Json::Value> commands = daemon_.Commands();
+  for (size_t i = daemon_forgotten_; i < commands.size(); ++i) {
+    out.push_back(commands[i]["type"].asString() + " " +
+                  commands[i]["data"]["share_name"].asString());
+  }
+  const std::vector<Json::Value> requests = search_.Requests();
+  for (size_t i = search_forgotten_; i < requests.size(); ++i) {
+    out.push_back(requests[i]["command"].asString() + " " + requests[i]["data"]["id"].asString());
+  }
+  for (const std::string& call : platform_.Calls()) {
+    if (call.rfind("MonitorQueue", 0) == 0) out.push_back(call);
   }
   return out;
 }
 
-std::vector<std::string> IndexMgrEnv::DaemonCommands() const {
-  std::vector<std::string> out;
-  for (const Json::Value& c : daemon_->Commands()) {
-    std::string text = c["type"].asString();
-    if (c["data"].isObject() && c["data"].isMember("share_name")) {
-      text += " " + c["data"]["share_name"].asString();
-    }
-    out.push_back(text);
-  }
-  return out;
+void IndexMgrTest::ForgetSent() {
+  search_forgotten_ = search_.Requests().size();
+  daemon_forgotten_ = daemon_.Commands().size();
+  platform_.ClearCalls();
+  platform_.ClearServiceCalls();
 }
 
-std::vector<Json::Value> IndexMgrEnv::DaemonCommandObjects() const { return daemon_->Commands(); }
-
-void IndexMgrEnv::ForgetSent() {
-  search_forgotten_ = SearchCommands().size();
-  daemon_forgotten_ = DaemonCommands().size();
-  platform_->ClearCalls();
-  platform_->ClearServiceCalls();
-}
-
-std::vector<std::string> IndexMgrEnv::NewSearchCommands() const {
-  std::vector<std::string> all = SearchCommands();
-  return {all.begin() + static_cast<long>(search_forgotten_), all.end()};
-}
-
-std::vector<std::string> IndexMgrEnv::NewDaemonCommands() const {
-  std::vector<std::string> all = DaemonCommands();
-  return {all.begin() + static_cast<long>(daemon_forgotten_), all.end()};
-}
-
-size_t IndexMgrEnv::CallCount(const std::string& call) const {
-  size_t n = 0;
-  for (const std::string& c : platform_->Calls()) n += c == call;
-  return n;
-}
-
-std::vector<FakeServicesPlatform::ServiceCall> ServicesStoppedCalls() {
+std::vector<ServiceCall> ServicesStoppedCalls() {
   return {{"QORUSMBSetSpotlight", "0"},
           {"QLIBServiceRestart", "samba"},
           {"QLIBServiceStop", "qorucontentextractd"},

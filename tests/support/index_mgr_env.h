@@ -1,17 +1,13 @@
-// A temporary root for the tests of the management operations: scripted
-// shares and services (FakeServicesPlatform), a fake search daemon and a
-// fake indexing daemon on their sockets, and readers of everything the
-// operations change.
+// The base fixture of the management operation tests: scripted shares and
+// services, fake search and indexing daemons, and readers of what changes.
 #pragma once
 
+#include <gtest/gtest.h>
 #include <json/json.h>
 
-#include <map>
-#include <memory>
 #include <string>
 #include <vector>
 
-#include "common/error.h"
 #include "tests/support/fake_index_daemon.h"
 #include "tests/support/fake_search_daemon.h"
 #include "tests/support/fake_services_platform.h"
@@ -20,71 +16,60 @@
 
 namespace vellis::testing {
 
-// The service calls made when the last indexed folder goes: file sharing
-// stops offering search, and the indexing services stop.
-std::vector<FakeServicesPlatform::ServiceCall> ServicesStoppedCalls();
+using Strings = std::vector<std::string>;
+using ServiceCall = FakeServicesPlatform::ServiceCall;
 
-class IndexMgrEnv {
+class IndexMgrTest : public ::testing::Test {
  public:
-  IndexMgrEnv();
-  ~IndexMgrEnv();
-
-  // Registers share `name` at "<root>/<volume>/<name>" and creates its
-  // folder; returns its full path.
-  std::string AddShare(const std::string& name, const std::string& volume = "volume1");
-  // "<root>/<volume>".
-  std::string Volume(const std::string& volume = "volume1") const;
-  // The live queue of share `name`, on the volume it was added to.
-  std::string QueuePath(const std::string& name) const;
-  // The events queued for share `name`, one object per line.
-  std::vector<Json::Value> QueueEvents(const std::string& name) const;
-  // A folder object as the folder record reads it.
+  // A folder as the folder record reads it, and lists of them.
   static Json::Value FolderJson(const std::string& path, bool document = true, bool audio = true,
                                 bool video = true, bool photo = true);
+  static Json::Value List(const std::vector<Json::Value>& folders);
+  static Json::Value List(const Strings& paths);
 
-  // The folders file as saved (null when there is none) and its paths.
+ protected:
+  IndexMgrTest();
+
+  // Registers share `name` at "<root>/<volume>/<name>" and creates its
+  // folder, its data folder and `dirs` below it; returns its full path.
+  std::string AddShare(const std::string& name, const Strings& dirs = {},
+                       const std::string& volume = "volume1");
+  std::string Volume(const std::string& v = "volume1") const { return root_.Path("/" + v); }
+  std::string QueuePath(const std::string& name) const;
+  // The events queued for share `name`: "<event> <path>[ <- <path_old>][
+  // <data>]", the paths without "<root>/<volume>".
+  Strings Events(const std::string& name) const;
+  // Adds `paths`, then forgets what that sent (ForgetSent).
+  void Given(const Strings& paths);
+
+  // The folders file (null when there is none) and its paths.
   Json::Value FoldersFile() const;
-  std::vector<std::string> FolderPaths() const;
-  // Rewrites the folders file with the same list in another layout (a
-  // leading space), so that FoldersFileSaved() tells whether it was saved
-  // since.
+  Strings FolderPaths() const;
+  // FoldersFileSaved() tells whether the list was saved since MarkFoldersFile().
   void MarkFoldersFile() const;
   bool FoldersFileSaved() const;
-  // The queues registered with the monitor for the application "fileindex"
-  // (an object keyed by queue path; null when none was ever written).
+  // The monitor's queues (null when never written); the folders it watches.
   Json::Value MonitorQueues() const;
+  Json::Value MonitorPaths(const std::string& name) const;
 
-  // "<command> <index id>" of each request the search daemon received.
-  std::vector<std::string> SearchCommands() const;
-  // "<type> <share_name>" of each daemon command ("<type>" alone when it
-  // has no share name), and the commands themselves.
-  std::vector<std::string> DaemonCommands() const;
-  std::vector<Json::Value> DaemonCommandObjects() const;
-  // Forgets what was sent and called so far (the set-up's own requests):
-  // the New* lists below start again, and the platform's recorded calls
-  // and service calls are cleared.
+  // Since the last ForgetSent(): "<type> <share_name>" per daemon command,
+  // then "<command> <index id>" per search request, then the monitor calls.
+  Strings Sent() const;
   void ForgetSent();
-  // SearchCommands() / DaemonCommands() since the last ForgetSent().
-  std::vector<std::string> NewSearchCommands() const;
-  std::vector<std::string> NewDaemonCommands() const;
-  // How often the platform call `call` was made.
-  size_t CallCount(const std::string& call) const;
+  size_t LogCount(const std::string& text) const { return platform_.LogsContaining(text).size(); }
 
-  FakeServicesPlatform& platform() { return *platform_; }
-  const FakeServicesPlatform& platform() const { return *platform_; }
-  FakeSearchDaemon& search() { return *search_; }
-  FakeIndexDaemon& daemon() { return *daemon_; }
-  const TempRoot& root() const { return root_; }
+  TempRoot root_;
+  FakeServicesPlatform platform_;
+  ScopedPlatform scoped_{&platform_};
+  FakeSearchDaemon search_;
+  FakeIndexDaemon daemon_;
 
  private:
-  TempRoot root_;
-  std::unique_ptr<FakeServicesPlatform> platform_;
-  std::unique_ptr<ScopedPlatform> scoped_;
-  std::unique_ptr<FakeSearchDaemon> search_;
-  std::unique_ptr<FakeIndexDaemon> daemon_;
-  std::map<std::string, std::string> share_volumes_;
   size_t search_forgotten_ = 0;
   size_t daemon_forgotten_ = 0;
 };
+
+// The service calls made when the last indexed folder goes.
+std::vector<ServiceCall> ServicesStoppedCalls();
 
 }  // namespace vellis::testing
