@@ -1,129 +1,41 @@
 #include "common/fs_util.h"
 
+#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <gtest/gtest.h>
-
 #include <string>
 
-#include "common/error.h"
 #include "sdk/credentials.h"
 #include "tests/support/fake_platform.h"
 #include "tests/support/temp_root.h"
+#include "tests/support/thrown.h"
 
 namespace vellis {
 namespace {
 
-using testing::FakePlatform;
 using testing::ReadFile;
-using testing::ScopedPlatform;
-using testing::TempRoot;
 using testing::WriteFile;
 
-TEST(PathStringTest, SplitsPathsAtTheLastSlash) {
+TEST(PathStringTest, SplitsAtTheLastSlashAndDotAndMatchesWholePrefixes) {
   struct Case {
-    std::string path, base, dir;
-  } cases[] = {
-      {"a/b/", "", "a/b"},  {"name", "name", "name"}, {"/a", "a", ""},
-      {"/x/y.txt", "y.txt", "/x"}, {"", "", ""},   {"/", "", ""},
-      {"a//b", "b", "a/"},
-  };
+    std::string path, base, dir, ext;
+  } cases[] = {{"a/b/", "", "a/b", ""},
+               {"name", "name", "name", ""},
+               {"/a", "a", "", ""},
+               {"/x.d/archive.TAR.Gz", "archive.TAR.Gz", "/x.d", "gz"},
+               {".profile", ".profile", ".profile", "profile"}};
   for (const auto& c : cases) {
-    EXPECT_EQ(Basename(c.path), c.base) << c.path;
-    EXPECT_EQ(Dirname(c.path), c.dir) << c.path;
+    EXPECT_EQ(Basename(c.path) + "|" + Dirname(c.path) + "|" + GetFileExtension(c.path, true),
+              c.base + "|" + c.dir + "|" + c.ext);
   }
+  EXPECT_EQ(GetFileExtension("/x/archive.TAR.GZ", false), "GZ");
+  EXPECT_TRUE(StringStartWith("/music2", "/music") && StringStartWith("abc", ""));
+  EXPECT_FALSE(StringStartWith("/volume1", "/volume10") || StringStartWith("abc", "b"));
 }
 
-TEST(PathStringTest, ExtensionOfTheBasename) {
-  struct Case {
-    std::string path;
-    bool lower;
-    std::string ext;
-  } cases[] = {
-      {"/x/archive.TAR.GZ", true, "gz"}, {"/x/archive.TAR.GZ", false, "GZ"},
-      {"/x.d/readme", true, ""},          {".profile", false, "profile"},
-      {"/a/b.", false, ""},               {"/a/dir.d/", false, ""},
-      {"name.\xc3\x89X", true, "\xc3\x89x"},
-  };
-  for (const auto& c : cases) EXPECT_EQ(GetFileExtension(c.path, c.lower), c.ext) << c.path;
-}
-
-TEST(PathStringTest, StringStartWith) {
-  struct Case {
-    std::string s, prefix;
-    bool expected;
-  } cases[] = {
-      {"", "", true},           {"abc", "", true},           {"abc", "abc", true},
-      {"abc", "abcd", false},   {"/music2", "/music", true}, {"/volume1", "/volume10", false},
-      {"abc", "b", false},
-  };
-  for (const auto& c : cases) {
-    EXPECT_EQ(StringStartWith(c.s, c.prefix), c.expected) << c.s << " / " << c.prefix;
-  }
-}
-
-class FsUtilTest : public ::testing::Test {
- protected:
-  void SetUp() override {
-    WriteFile(file_, "content");
-    testing::MakeDirs(dir_);
-    ASSERT_EQ(symlink(file_.c_str(), Path("/link-file").c_str()), 0);
-    ASSERT_EQ(symlink(dir_.c_str(), Path("/link-dir").c_str()), 0);
-    ASSERT_EQ(symlink(Path("/link-dir").c_str(), Path("/link-link-dir").c_str()), 0);
-    ASSERT_EQ(symlink(Path("/loop-b").c_str(), Path("/loop-a").c_str()), 0);
-    ASSERT_EQ(symlink(Path("/loop-a").c_str(), Path("/loop-b").c_str()), 0);
-    ASSERT_EQ(mkfifo(Path("/fifo").c_str(), 0644), 0);
-  }
-  std::string Path(const std::string& rel) const { return root_.Path("/t" + rel); }
-
-  TempRoot root_;
-  std::string file_ = Path("/file");
-  std::string dir_ = Path("/dir");
-};
-
-TEST_F(FsUtilTest, ClassifiesEntriesWithoutFollowingLinksUnlessAsked) {
-  struct Case {
-    std::string rel;
-    bool file, dir, dir_followed;
-  } cases[] = {
-      {"/file", true, false, false},          {"/dir", false, true, true},
-      {"/link-file", false, false, false},    {"/link-dir", false, false, true},
-      {"/link-link-dir", false, false, true}, {"/loop-a", false, false, false},
-      {"/fifo", false, false, false},         {"/missing", false, false, false},
-  };
-  for (const auto& c : cases) {
-    EXPECT_EQ(IsFileExist(Path(c.rel)), c.file) << c.rel;
-    EXPECT_EQ(IsDirExist(Path(c.rel), false), c.dir) << c.rel;
-    EXPECT_EQ(IsDirExist(Path(c.rel), true), c.dir_followed) << c.rel;
-  }
-}
-
-TEST_F(FsUtilTest, UnlinkAndRealPath) {
-  EXPECT_TRUE(Unlink(Path("/missing")));
-  EXPECT_TRUE(Unlink(Path("/link-file")));
-  EXPECT_EQ(ReadFile(file_), "content") << "unlinking a link removed its target";
-  EXPECT_FALSE(Unlink(dir_));
-  EXPECT_TRUE(IsDirExist(dir_, false));
-  EXPECT_EQ(RealPath(Path("/link-link-dir")), RealPath(dir_));
-  EXPECT_EQ(RealPath(Path("/loop-a")), "");
-}
-
-TEST_F(FsUtilTest, MoveAndCopyReplaceTheDestination) {
-  const std::string dest = dir_ + "/dest";
-  WriteFile(dest, "older and longer");
-  ASSERT_TRUE(CPFile(file_, dest));
-  EXPECT_EQ(ReadFile(dest), "content");
-  EXPECT_EQ(ReadFile(file_), "content");
-  WriteFile(file_, "moved");
-  ASSERT_TRUE(MVFile(file_, dest));
-  EXPECT_EQ(ReadFile(dest), "moved");
-  EXPECT_FALSE(IsFileExist(file_));
-  EXPECT_FALSE(CPFile(Path("/missing"), dest));
-}
-
-// Answers the user and file-system calls from a script.
-class ScriptedPlatform : public FakePlatform {
+// Answers the user and permission queries from a script.
+class ScriptedPlatform : public testing::FakePlatform {
  public:
   int QORUUserGet(const std::string& name, sdk::UserInfo* out) override {
     asked_user = name;
@@ -136,64 +48,91 @@ class ScriptedPlatform : public FakePlatform {
   }
   int QORUFSDirIsMntPoint(const std::string&) override { return mount_result; }
 
-  int user_result = -1;
+  int user_result = -1, acl_result = 0, granted = 0, mount_result = 0;
   sdk::UserInfo user;
   std::string asked_user;
-  int acl_result = 0;
-  int granted = 0;
-  int mount_result = 0;
 };
 
-TEST_F(FsUtilTest, ChownVellisThrowsWhenTheServiceUserIsUnknown) {
-  ScriptedPlatform platform;
-  ScopedPlatform scoped(&platform);
-  try {
-    ChownVellis(file_);
-    ADD_FAILURE() << "no error for an unknown service user";
-  } catch (const Error& e) {
-    EXPECT_EQ(e.GetCode(), kErrServiceUser);
+class FsUtilTest : public ::testing::Test {
+ protected:
+  std::string Path(const std::string& rel) const { return root_.Path("/t" + rel); }
+
+  testing::TempRoot root_;
+  std::string file_ = Path("/file");
+  std::string dir_ = Path("/dir");
+  ScriptedPlatform platform_;
+  testing::ScopedPlatform scoped_{&platform_};
+};
+
+TEST_F(FsUtilTest, ClassifiesEntriesWithoutFollowingLinksUnlessAsked) {
+  WriteFile(file_, "content");
+  testing::MakeDirs(dir_);
+  const std::pair<std::string, const char*> links[] = {{file_, "/link-file"},
+                                                       {dir_, "/link-dir"},
+                                                       {Path("/link-dir"), "/link-link-dir"},
+                                                       {Path("/loop-b"), "/loop-a"},
+                                                       {Path("/loop-a"), "/loop-b"}};
+  for (const auto& [target, link] : links)
+    ASSERT_EQ(symlink(target.c_str(), Path(link).c_str()), 0);
+  ASSERT_EQ(mkfifo(Path("/fifo").c_str(), 0644), 0);
+  struct Case {
+    std::string rel;
+    bool file, dir, dir_followed;
+  } cases[] = {{"/file", true, false, false},          {"/dir", false, true, true},
+               {"/link-file", false, false, false},    {"/link-dir", false, false, true},
+               {"/link-link-dir", false, false, true}, {"/loop-a", false, false, false},
+               {"/fifo", false, false, false},         {"/missing", false, false, false}};
+  for (const auto& c : cases) {
+    EXPECT_EQ(IsFileExist(Path(c.rel)), c.file) << c.rel;
+    EXPECT_EQ(IsDirExist(Path(c.rel), false), c.dir) << c.rel;
+    EXPECT_EQ(IsDirExist(Path(c.rel), true), c.dir_followed) << c.rel;
   }
-  EXPECT_EQ(platform.asked_user, "Vellis");
-  EXPECT_TRUE(sdk::SDKMutex().TryLock()) << "the SDK mutex stayed held after the error";
-  sdk::SDKMutex().Unlock();
+  EXPECT_EQ(RealPath(Path("/link-link-dir")), RealPath(dir_));
+  EXPECT_EQ(RealPath(Path("/loop-a")), "");
+}
+
+TEST_F(FsUtilTest, UnlinkMoveAndCopyReplaceOnlyTheirTarget) {
+  const std::string dest = dir_ + "/dest";
+  WriteFile(file_, "content");
+  WriteFile(dest, "older and longer");
+  ASSERT_EQ(symlink(file_.c_str(), Path("/link").c_str()), 0);
+  EXPECT_TRUE(Unlink(Path("/link")) && Unlink(Path("/missing")));
+  EXPECT_FALSE(Unlink(dir_));
+  ASSERT_TRUE(CPFile(file_, dest));
+  EXPECT_EQ(ReadFile(dest) + "|" + ReadFile(file_), "content|content");
+  WriteFile(file_, "moved");
+  ASSERT_TRUE(MVFile(file_, dest));
+  EXPECT_EQ(ReadFile(dest) + "|" + ReadFile(file_), "moved|");
+  EXPECT_FALSE(CPFile(Path("/missing"), dest));
 }
 
 TEST_F(FsUtilTest, ChownVellisGivesTheFileToTheServiceUser) {
-  ScriptedPlatform platform;
-  ScopedPlatform scoped(&platform);
+  WriteFile(file_, "content");
+  EXPECT_EQ(testing::Thrown([&] { ChownVellis(file_); }), "801 QORUUserGet failed, user=Vellis");
+  EXPECT_EQ(platform_.asked_user, "Vellis");
+  ASSERT_TRUE(sdk::SDKMutex().TryLock()) << "the SDK mutex stayed held after the error";
+  sdk::SDKMutex().Unlock();
   // Without the right to give files away, give the file to ourselves.
   const bool privileged = geteuid() == 0;
-  platform.user_result = 0;
-  platform.user.uid = privileged ? 4321 : geteuid();
-  platform.user.gid = privileged ? 8765 : getegid();
+  platform_.user_result = 0;
+  platform_.user.uid = privileged ? 4321 : geteuid();
+  platform_.user.gid = privileged ? 8765 : getegid();
   ASSERT_TRUE(ChownVellis(file_));
   struct stat st;
   ASSERT_EQ(lstat(file_.c_str(), &st), 0);
-  EXPECT_EQ(st.st_uid, platform.user.uid);
-  EXPECT_EQ(st.st_gid, platform.user.gid);
+  EXPECT_EQ(st.st_uid, platform_.user.uid);
+  EXPECT_EQ(st.st_gid, platform_.user.gid);
   EXPECT_FALSE(ChownVellis(Path("/missing")));
 }
 
 TEST_F(FsUtilTest, PermissionAndMountAnswersOfThePlatform) {
-  ScriptedPlatform platform;
-  ScopedPlatform scoped(&platform);
-  struct Case {
-    int acl_result, granted, wanted;
-    bool allowed;
-  } acl[] = {
-      {0, sdk::kAclWrite, sdk::kAclRead | sdk::kAclWrite, true},
-      {0, sdk::kAclRead, sdk::kAclWrite, false},
-      {0, 0, sdk::kAclRead, false},
-      {-1, sdk::kAclRead, sdk::kAclRead, false},
-  };
-  for (const auto& c : acl) {
-    platform.acl_result = c.acl_result;
-    platform.granted = c.granted;
-    EXPECT_EQ(CheckACLPerm(file_, c.wanted), c.allowed)
-        << "result=" << c.acl_result << " granted=" << c.granted << " wanted=" << c.wanted;
-  }
+  platform_.granted = sdk::kAclWrite;
+  EXPECT_TRUE(CheckACLPerm(file_, sdk::kAclRead | sdk::kAclWrite)) << "any bit will do";
+  EXPECT_FALSE(CheckACLPerm(file_, sdk::kAclRead));
+  platform_.acl_result = -1;
+  EXPECT_FALSE(CheckACLPerm(file_, sdk::kAclWrite)) << "the platform cannot say";
   for (int result : {1, 0, -1}) {
-    platform.mount_result = result;
+    platform_.mount_result = result;
     EXPECT_EQ(IsMountPoint(dir_), result == 1) << "platform answered " << result;
   }
 }

@@ -24,28 +24,6 @@ TEST(FrameTest, HeaderRoundTripsUsableLengths) {
   }
 }
 
-TEST(FrameTest, RefusesLengthsNoJsonTextCanHave) {
-  struct Case {
-    uint32_t length;
-    const char* explanation;
-  } cases[] = {
-      {0, "length is 0"},
-      {kMaxMessageSize + 1, "above the maximum"},
-      {0xFFFFFFFFu, "above the maximum"},
-      {__builtin_bswap32(100u), "above the maximum"},  // a peer of the other byte order
-  };
-  for (const auto& c : cases) {
-    std::string header = EncodeFrameHeader(c.length);
-    uint32_t decoded = 0;
-    std::string error;
-    EXPECT_FALSE(
-        DecodeFrameHeader(reinterpret_cast<const unsigned char*>(header.data()), &decoded, &error))
-        << c.length;
-    EXPECT_NE(error.find(c.explanation), std::string::npos) << c.length << ": " << error;
-    EXPECT_EQ(decoded, c.length);
-  }
-}
-
 TEST(FrameTest, EncodesPayloadAfterHeaderAndRefusesEmptyOne) {
   std::string frame = "untouched";
   std::string error;
@@ -77,13 +55,22 @@ TEST(FrameReaderTest, AssemblesAMessageFromPiecesOfAnySize) {
 }
 
 TEST(FrameReaderTest, RefusesBadLengthsWithoutAllocatingThem) {
-  for (uint32_t length : {0u, kMaxMessageSize + 1, 0xFFFFFFFFu, __builtin_bswap32(100u)}) {
+  const struct {
+    uint32_t length;
+    const char* explanation;
+  } cases[] = {
+      {0, "length is 0"},
+      {kMaxMessageSize + 1, "above the maximum"},
+      {0xFFFFFFFFu, "above the maximum"},
+      {__builtin_bswap32(100u), "above the maximum"},  // a peer of the other byte order
+  };
+  for (const auto& c : cases) {
     FrameReader reader;
-    const std::string bytes = EncodeFrameHeader(length) + "{}";
-    EXPECT_EQ(reader.Feed(bytes.data(), bytes.size()), kFrameHeaderSize) << length;
-    EXPECT_EQ(reader.state(), FrameReader::State::kBadLength) << length;
-    EXPECT_FALSE(reader.error().empty()) << length;
-    EXPECT_EQ(reader.length(), length);
+    const std::string bytes = EncodeFrameHeader(c.length) + "{}";
+    EXPECT_EQ(reader.Feed(bytes.data(), bytes.size()), kFrameHeaderSize) << c.length;
+    EXPECT_EQ(reader.state(), FrameReader::State::kBadLength) << c.length;
+    EXPECT_NE(reader.error().find(c.explanation), std::string::npos) << reader.error();
+    EXPECT_EQ(reader.length(), c.length);
   }
   // A large length that is allowed: memory grows with what arrives.
   FrameReader reader;

@@ -2,20 +2,18 @@
 
 #include <ftw.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <cstdlib>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
-#include <vector>
 
 #include "common/root_path.h"
 
 namespace vellis::testing {
 namespace {
 
-int RemoveEntry(const char* path, const struct stat*, int, struct FTW*) {
+int RemoveEntry(const char* path, const struct stat*, int, FTW*) {
   remove(path);
   return 0;
 }
@@ -31,20 +29,16 @@ void MakeDirs(const std::string& path) {
 TempRoot::TempRoot() {
   const char* tmpdir = getenv("TMPDIR");
   std::string tmpl = std::string(tmpdir && *tmpdir ? tmpdir : "/tmp") + "/vellis-test-XXXXXX";
-  std::vector<char> buf(tmpl.begin(), tmpl.end());
-  buf.push_back('\0');
-  if (mkdtemp(buf.data()) == nullptr) throw std::runtime_error("mkdtemp failed");
-  path_ = buf.data();
+  if (mkdtemp(tmpl.data()) == nullptr) throw std::runtime_error("mkdtemp failed");
+  path_ = tmpl;
   for (const char* dir : {"/tmp", "/var/run", "/var/packages/Vellis/etc"}) MakeDirs(path_ + dir);
-  const char* old = getenv(kRootEnv);
-  had_old_ = old != nullptr;
-  if (old) old_ = old;
+  if (const char* old = getenv(kRootEnv)) old_ = old;
   setenv(kRootEnv, path_.c_str(), 1);
 }
 
 TempRoot::~TempRoot() {
-  if (had_old_) {
-    setenv(kRootEnv, old_.c_str(), 1);
+  if (old_) {
+    setenv(kRootEnv, old_->c_str(), 1);
   } else {
     unsetenv(kRootEnv);
   }
@@ -55,14 +49,12 @@ void WriteFile(const std::string& path, const std::string& content) {
   size_t slash = path.rfind('/');
   if (slash != std::string::npos && slash > 0) MakeDirs(path.substr(0, slash));
   std::ofstream out(path, std::ios::binary | std::ios::trunc);
-  out << content;
-  if (!out) throw std::runtime_error("cannot write " + path);
+  if (!(out << content)) throw std::runtime_error("cannot write " + path);
 }
 
 std::string ReadFile(const std::string& path) {
-  std::ifstream in(path, std::ios::binary);
   std::ostringstream ss;
-  ss << in.rdbuf();
+  ss << std::ifstream(path, std::ios::binary).rdbuf();
   return ss.str();
 }
 

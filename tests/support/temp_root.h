@@ -1,6 +1,7 @@
 // A temporary root directory for one test, named by $VELLIS_ROOT.
 #pragma once
 
+#include <optional>
 #include <string>
 
 namespace vellis::testing {
@@ -21,8 +22,7 @@ class TempRoot {
 
  private:
   std::string path_;
-  bool had_old_ = false;
-  std::string old_;
+  std::optional<std::string> old_;
 };
 
 // Whole-file helpers for tests. WriteFile creates parent folders.

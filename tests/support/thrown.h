@@ -4,9 +4,18 @@
 #include <functional>
 #include <string>
 
+#include "common/error.h"
+
 namespace vellis::testing {
 
 // "<code> <reason>" of the vellis::Error that `fn` throws, or "no error".
-std::string Thrown(const std::function<void()>& fn);
+inline std::string Thrown(const std::function<void()>& fn) {
+  try {
+    fn();
+  } catch (const Error& e) {
+    return std::to_string(e.GetCode()) + " " + e.what();
+  }
+  return "no error";
+}
 
 }  // namespace vellis::testing
