@@ -6,7 +6,6 @@
 #include <unistd.h>
 
 #include <cstring>
-#include <functional>
 #include <memory>
 #include <thread>
 
@@ -16,6 +15,7 @@
 #include "tests/support/fake_platform.h"
 #include "tests/support/fake_search_daemon.h"
 #include "tests/support/temp_root.h"
+#include "tests/support/thrown.h"
 
 namespace vellis::sdk {
 namespace {
@@ -23,6 +23,7 @@ namespace {
 using testing::FakePlatform;
 using testing::FakeSearchDaemon;
 using testing::ScopedPlatform;
+using testing::Thrown;
 
 class SockConnectionTest : public ::testing::Test {
  protected:
@@ -93,58 +94,34 @@ TEST_F(SockConnectionTest, FailedSendClosesTheConnectionWithoutSignal) {
   EXPECT_EQ(platform_.LogsContaining("send refused: message length 0").size(), 1u);
 }
 
-TEST(DomainSockConnectionTest, ConnectsOnlyWhereADaemonListens) {
-  FakePlatform platform;
-  ScopedPlatform scoped(&platform);
-  testing::TempRoot root;
-  DomainSockConnection missing(root.Path("/var/run/nobody.sock"));
-  EXPECT_EQ(missing.fd(), -1);
-  EXPECT_FALSE(missing.Connect());
-  EXPECT_EQ(missing.fd(), -1);
-
-  DomainSockConnection too_long("/" + std::string(200, 'a'));
-  EXPECT_FALSE(too_long.Connect());
-  EXPECT_EQ(errno, ENAMETOOLONG);
-
-  FakeSearchDaemon daemon(root.Path("/var/run/x.sock"));
-  daemon.Push(FakeSearchDaemon::Raw("{\"answer\":1}"));
-  DomainSockConnection conn(root.Path("/var/run/x.sock"));
-  ASSERT_TRUE(conn.Connect());
-  EXPECT_GE(conn.fd(), 0);
-  std::string answer;
-  EXPECT_TRUE(conn.Send("{\"question\":1}"));
-  EXPECT_TRUE(conn.Recv(answer));
-  EXPECT_EQ(answer, "{\"answer\":1}");
-  conn.Disconnect();
-  EXPECT_EQ(conn.fd(), -1);
-  ASSERT_EQ(daemon.RawRequests().size(), 1u);
-  EXPECT_EQ(daemon.RawRequests()[0], "{\"question\":1}");
-}
-
-TEST(ExchangeTest, OneRequestOneAnswerOrError913NamingTheStep) {
+// A connection is made only where a daemon listens; one request gets one
+// answer, or Error 913 naming the step.
+TEST(DomainSockConnectionTest, OneRequestOneAnswerOrError913NamingTheStep) {
   FakePlatform platform;
   ScopedPlatform scoped(&platform);
   testing::TempRoot root;
   const std::string path = root.Path("/var/run/x.sock");
-  auto code_and_reason = [&](const std::function<void()>& call) -> std::string {
-    try {
-      call();
-    } catch (const Error& e) {
-      return std::to_string(e.GetCode()) + " " + e.what();
-    }
-    return "no error";
-  };
-  EXPECT_EQ(code_and_reason([&] {
-              Exchange(path, Json::Value());
-            }).rfind("913 Connect failed: " + path, 0),
+  DomainSockConnection too_long("/" + std::string(200, 'a'));
+  EXPECT_FALSE(too_long.Connect());
+  EXPECT_EQ(errno, ENAMETOOLONG);
+  EXPECT_EQ(Thrown([&] { Exchange(path, Json::Value()); }).rfind("913 Connect failed: " + path, 0),
             0u);
+
   FakeSearchDaemon daemon(path);
+  DomainSockConnection conn(path);
+  ASSERT_TRUE(conn.Connect());
+  std::string answer;
+  EXPECT_TRUE(conn.Send("{\"question\":1}") && conn.Recv(answer));
+  EXPECT_EQ(answer, "{\"success\":true}");
+  conn.Disconnect();
+  EXPECT_EQ(conn.fd(), -1);
+  EXPECT_EQ(daemon.RawRequests(), std::vector<std::string>{"{\"question\":1}"});
   daemon.Push(FakeSearchDaemon::Raw("{\"success\":true,\"data\":7}"));
   EXPECT_EQ(Exchange(path, Json::Value(Json::objectValue))["data"].asInt(), 7);
   daemon.Push(FakeSearchDaemon::Raw("[1]"));
-  EXPECT_EQ(code_and_reason([&] { Exchange(path, Json::Value()); }), "913 Recv failed, res=[1]");
+  EXPECT_EQ(Thrown([&] { Exchange(path, Json::Value()); }), "913 Recv failed, res=[1]");
   daemon.Push({"", /*close=*/true});
-  EXPECT_EQ(code_and_reason([&] { ExchangeText(path, "{}"); }), "913 Recv failed: " + path);
+  EXPECT_EQ(Thrown([&] { ExchangeText(path, "{}"); }), "913 Recv failed: " + path);
 }
 
 TEST(DomainSockConnectionTest, DaemonThatNeverAcceptsIsNotWaitedForForever) {
