@@ -57,7 +57,8 @@ ServerLoop::ServerLoop(ServerOptions options, Handler handler, Upkeep upkeep, Cl
 }
 
 ServerLoop::~ServerLoop() {
-  pool_.reset();  // running handlers finish; their fds are still open
+  pool_.reset();  // running handlers finish
+  TakeDone();     // forgets the connections that the workers closed
   for (auto& entry : connections_) close(entry.second.fd);
   if (listen_fd_ >= 0) {
     close(listen_fd_);
@@ -126,15 +127,28 @@ void ServerLoop::ClearDeadline(uint64_t id, Connection& c) {
   c.timed = false;
 }
 
-void ServerLoop::Close(uint64_t id) {
+void ServerLoop::Forget(uint64_t id, bool close_fd) {
   auto it = connections_.find(id);
   if (it == connections_.end()) return;
   Connection& c = it->second;
   ClearDeadline(id, c);
   idle_.erase(id);
   if (c.state == State::kWorking) --working_;
-  close(c.fd);  // also takes it out of the epoll set
+  if (close_fd) close(c.fd);  // also takes it out of the epoll set
   connections_.erase(it);
+}
+
+bool ServerLoop::Watch(uint64_t id, Connection& c, uint32_t events) {
+  epoll_event ev{};
+  ev.events = events;
+  ev.data.u64 = id;
+  if (epoll_ctl(epoll_fd_, c.watched ? EPOLL_CTL_MOD : EPOLL_CTL_ADD, c.fd, &ev) != 0) {
+    Log(LOG_ERR, std::string("epoll_ctl: ") + strerror(errno));
+    Close(id);
+    return false;
+  }
+  c.watched = true;
+  return true;
 }
 
 bool ServerLoop::MakeRoom() {
@@ -190,15 +204,8 @@ void ServerLoop::AcceptAll() {
     ++stats_.accepted;
     idle_.insert(id);
     SetDeadline(id, c, Now() + options_.request_timeout_ms);
-    epoll_event ev{};
-    ev.events = EPOLLIN | EPOLLRDHUP;
-    ev.data.u64 = id;
-    if (epoll_ctl(epoll_fd_, EPOLL_CTL_ADD, fd, &ev) != 0) {
-      Log(LOG_ERR, std::string("epoll_ctl: ") + strerror(errno));
-      Close(id);
-      continue;
-    }
-    // Clients send right after connecting: the request is often there.
+    // Clients send right after connecting: the request is often there
+    // already, and the connection need never be watched.
     OnReadable(id, c);
   }
 }
@@ -208,7 +215,10 @@ void ServerLoop::OnReadable(uint64_t id, Connection& c) {
   while (c.reader.state() == sdk::FrameReader::State::kNeedMore) {
     ssize_t n = recv(c.fd, buf, sizeof(buf), MSG_DONTWAIT);
     if (n < 0 && errno == EINTR) continue;
-    if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) return;
+    if (n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK)) {
+      if (!c.watched) Watch(id, c, EPOLLIN | EPOLLRDHUP);
+      return;
+    }
     if (n <= 0) {
       if (c.reader.started()) {
         ++stats_.dropped;
@@ -233,9 +243,10 @@ void ServerLoop::OnReadable(uint64_t id, Connection& c) {
 }
 
 void ServerLoop::Dispatch(uint64_t id, Connection& c) {
-  // The worker owns the descriptor's traffic now; the loop stops watching
-  // it, so that a hang-up meanwhile cannot wake the loop again and again.
-  epoll_ctl(epoll_fd_, EPOLL_CTL_DEL, c.fd, nullptr);
+  // The worker owns the descriptor now; the loop stops watching it, so that
+  // a hang-up meanwhile cannot wake the loop again and again.
+  if (c.watched) epoll_ctl(epoll_fd_, EPOLL_CTL_DEL, c.fd, nullptr);
+  c.watched = false;
   ClearDeadline(id, c);
   c.state = State::kWorking;
   ++working_;
@@ -259,9 +270,11 @@ void ServerLoop::RunRequest(uint64_t id, int fd, Request request) {
   std::string frame;
   std::string why;
   if (answer.empty() || !sdk::EncodeFrame(answer, &frame, &why)) {
-    if (answer.empty()) Log(LOG_ERR, "no answer to a request");
-    if (!answer.empty()) Log(LOG_ERR, "answer not sent: " + why);
-    Post(std::move(done));
+    Log(LOG_ERR,
+        answer.empty() ? std::string("no answer to a request") : "answer not sent: " + why);
+    close(fd);
+    done.closed = true;
+    Post(std::move(done), false);
     return;
   }
   // Most answers fit the socket buffer: the worker sends them itself and
@@ -277,23 +290,42 @@ void ServerLoop::RunRequest(uint64_t id, int fd, Request request) {
       break;
     }
   }
+  if (sent < frame.size() && (errno == EAGAIN || errno == EWOULDBLOCK)) {
+    // The loop writes the rest as the client takes it.
+    done.rest = frame.substr(sent);
+    Post(std::move(done), true);
+    return;
+  }
   if (sent == frame.size()) {
     done.answered = true;
-  } else if (errno == EAGAIN || errno == EWOULDBLOCK) {
-    done.rest = frame.substr(sent);
   } else {
     Log(LOG_WARNING, std::string("answer not delivered: ") + strerror(errno));
   }
-  Post(std::move(done));
+  // Done with the connection: closing it here spares the loop a wake-up
+  // per request; the loop forgets it on its next round.
+  close(fd);
+  done.closed = true;
+  Post(std::move(done), false);
 }
 
-void ServerLoop::Post(Done done) {
+void ServerLoop::Post(Done done, bool wake) {
   {
     std::lock_guard<std::mutex> lock(done_mu_);
     done_.push_back(std::move(done));
   }
+  if (!wake) return;
   const uint64_t one = 1;
   (void)!write(wake_fd_, &one, sizeof(one));
+}
+
+void ServerLoop::TakeDone() {
+  std::vector<Done> done;
+  {
+    std::lock_guard<std::mutex> lock(done_mu_);
+    if (done_.empty()) return;
+    done.swap(done_);
+  }
+  for (const Done& d : done) Finish(d);
 }
 
 void ServerLoop::Finish(const Done& done) {
@@ -306,9 +338,9 @@ void ServerLoop::Finish(const Done& done) {
   auto it = connections_.find(done.id);
   if (it == connections_.end()) return;
   Connection& c = it->second;
-  if (done.rest.empty()) {
-    if (done.answered) ++stats_.answered;
-    Close(done.id);
+  if (done.answered) ++stats_.answered;
+  if (done.closed) {
+    Forget(done.id, false);
     return;
   }
   --working_;
@@ -316,10 +348,7 @@ void ServerLoop::Finish(const Done& done) {
   c.out = done.rest;
   c.out_done = 0;
   SetDeadline(done.id, c, Now() + options_.answer_timeout_ms);
-  epoll_event ev{};
-  ev.events = EPOLLOUT;
-  ev.data.u64 = done.id;
-  if (epoll_ctl(epoll_fd_, EPOLL_CTL_ADD, c.fd, &ev) != 0) Close(done.id);
+  Watch(done.id, c, EPOLLOUT);
 }
 
 void ServerLoop::OnWritable(uint64_t id, Connection& c) {
@@ -383,7 +412,7 @@ void ServerLoop::MaybeRunUpkeep() {
     } catch (const std::exception& e) {
       Log(LOG_ERR, std::string("upkeep failed: ") + e.what());
     }
-    Post(std::move(done));
+    Post(std::move(done), true);
   });
 }
 
@@ -422,13 +451,8 @@ void ServerLoop::Step(int timeout_ms) {
   if (woken) {
     uint64_t count;
     (void)!read(wake_fd_, &count, sizeof(count));
-    std::vector<Done> done;
-    {
-      std::lock_guard<std::mutex> lock(done_mu_);
-      done.swap(done_);
-    }
-    for (const Done& d : done) Finish(d);
   }
+  TakeDone();  // also what was posted without a wake-up
   if (accept) AcceptAll();
   ExpireDeadlines();
   MaybeRunUpkeep();

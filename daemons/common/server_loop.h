@@ -120,7 +120,8 @@ class ServerLoop {
     int fd = -1;
     Peer peer;
     State state = State::kReading;
-    bool timed = false;  // `deadline` is in deadlines_
+    bool watched = false;  // in the epoll set
+    bool timed = false;    // `deadline` is in deadlines_
     int64_t deadline = 0;
     sdk::FrameReader reader;
     std::string out;  // the answer frame, while the loop writes it
@@ -132,6 +133,7 @@ class ServerLoop {
     bool upkeep = false;       // the upkeep's word, not a request's
     bool upkeep_more = false;  // the upkeep has more to do
     bool answered = false;     // the whole answer went out
+    bool closed = false;       // the worker closed the descriptor
     std::string rest;          // answer bytes that the worker could not write
   };
 
@@ -147,10 +149,16 @@ class ServerLoop {
   int64_t UpkeepDue() const;
   void SetDeadline(uint64_t id, Connection& c, int64_t deadline);
   void ClearDeadline(uint64_t id, Connection& c);
-  void Close(uint64_t id);
+  // Forgets a connection; Close also closes its descriptor.
+  void Close(uint64_t id) { Forget(id, true); }
+  void Forget(uint64_t id, bool close_fd);
+  bool Watch(uint64_t id, Connection& c, uint32_t events);
+  void TakeDone();
   bool MakeRoom();
   void Log(int priority, const std::string& text) const;
-  void Post(Done done);
+  // Hands a worker's word to the loop; `wake` wakes the loop for it, else
+  // the loop takes it on its next round.
+  void Post(Done done, bool wake);
 
   ServerOptions options_;
   Handler handler_;
