@@ -17,26 +17,23 @@ namespace {
 // done with it (the sanitizer build reports a double free, a use after free
 // or a leak otherwise).
 TEST(ArenaTest, ObjectsKeepTheArenaUntilTheLastOneGoesOnAnyThread) {
+  auto text = [](size_t i) { return std::to_string(i) + std::string(i % 500, 'x'); };
   for (int round = 0; round < 50; ++round) {
     Arena* arena = Arena::New();
+    ArenaAllocator<std::string> alloc(arena);
     std::vector<std::shared_ptr<std::string>> halves[2];
-    for (int i = 0; i < 2000; ++i) {
-      halves[i % 2].push_back(std::allocate_shared<std::string>(
-          ArenaAllocator<std::string>(arena), std::to_string(i) + std::string(i % 500, 'x')));
-    }
-    halves[0].push_back(std::allocate_shared<std::string>(ArenaAllocator<std::string>(arena),
-                                                          std::string(200000, 'y')));
+    for (size_t i = 0; i < 2000; ++i)
+      halves[i % 2].push_back(std::allocate_shared<std::string>(alloc, text(i)));
+    halves[0].push_back(std::allocate_shared<std::string>(alloc, std::string(200000, 'y')));
     ASSERT_GE(arena->BlockBytes(), 200000u);
     arena->Unref();
     std::atomic<int> ready{0};
     std::atomic<bool> intact{true};
-    auto drop = [&](int half) {
+    auto drop = [&](size_t half) {
       for (ready.fetch_add(1); ready.load() < 2;) {
       }
       for (size_t i = 0; i < 1000; ++i) {
-        const std::string& s = *halves[half][i];
-        if (s != std::to_string(2 * i + half) + std::string((2 * i + half) % 500, 'x'))
-          intact = false;
+        if (*halves[half][i] != text(2 * i + half)) intact = false;
       }
       halves[half].clear();
     };

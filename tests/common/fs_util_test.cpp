@@ -19,27 +19,27 @@ using testing::WriteFile;
 
 TEST(PathStringTest, SplitsAtTheLastSlashAndDotAndMatchesWholePrefixes) {
   struct Case {
-    std::string path, base, dir, ext;
-  } cases[] = {{"a/b/", "", "a/b", ""},
-               {"name", "name", "name", ""},
-               {"/a", "a", "", ""},
-               {"/x.d/archive.TAR.Gz", "archive.TAR.Gz", "/x.d", "gz"},
-               {".profile", ".profile", ".profile", "profile"}};
+    std::string path, expected;  // "base|dir|lowered extension"
+  } cases[] = {{"a/b/", "|a/b|"},
+               {"name", "name|name|"},
+               {"/a", "a||"},
+               {"/x.d/archive.TAR.Gz", "archive.TAR.Gz|/x.d|gz"},
+               {".profile", ".profile|.profile|profile"}};
   for (const auto& c : cases) {
     EXPECT_EQ(Basename(c.path) + "|" + Dirname(c.path) + "|" + GetFileExtension(c.path, true),
-              c.base + "|" + c.dir + "|" + c.ext);
+              c.expected);
   }
   EXPECT_EQ(GetFileExtension("/x/archive.TAR.GZ", false), "GZ");
   EXPECT_TRUE(StringStartWith("/music2", "/music") && StringStartWith("abc", ""));
   EXPECT_FALSE(StringStartWith("/volume1", "/volume10") || StringStartWith("abc", "b"));
 }
 
-// Answers the user and permission queries from a script.
+// Answers the user, permission and mount queries from a script.
 class ScriptedPlatform : public testing::FakePlatform {
  public:
   int QORUUserGet(const std::string& name, sdk::UserInfo* out) override {
     asked_user = name;
-    if (user_result == 0) *out = user;
+    *out = user;
     return user_result;
   }
   int QORUACLPermGet(const std::string&, int* perm) override {
@@ -58,8 +58,7 @@ class FsUtilTest : public ::testing::Test {
   std::string Path(const std::string& rel) const { return root_.Path("/t" + rel); }
 
   testing::TempRoot root_;
-  std::string file_ = Path("/file");
-  std::string dir_ = Path("/dir");
+  std::string file_ = Path("/file"), dir_ = Path("/dir");
   ScriptedPlatform platform_;
   testing::ScopedPlatform scoped_{&platform_};
 };
@@ -125,12 +124,14 @@ TEST_F(FsUtilTest, ChownVellisGivesTheFileToTheServiceUser) {
   EXPECT_FALSE(ChownVellis(Path("/missing")));
 }
 
+// Any granted bit will do; a platform that cannot say grants nothing, and
+// only a definite answer makes a mount point.
 TEST_F(FsUtilTest, PermissionAndMountAnswersOfThePlatform) {
   platform_.granted = sdk::kAclWrite;
-  EXPECT_TRUE(CheckACLPerm(file_, sdk::kAclRead | sdk::kAclWrite)) << "any bit will do";
+  EXPECT_TRUE(CheckACLPerm(file_, sdk::kAclRead | sdk::kAclWrite));
   EXPECT_FALSE(CheckACLPerm(file_, sdk::kAclRead));
   platform_.acl_result = -1;
-  EXPECT_FALSE(CheckACLPerm(file_, sdk::kAclWrite)) << "the platform cannot say";
+  EXPECT_FALSE(CheckACLPerm(file_, sdk::kAclWrite));
   for (int result : {1, 0, -1}) {
     platform_.mount_result = result;
     EXPECT_EQ(IsMountPoint(dir_), result == 1) << "platform answered " << result;

@@ -5,7 +5,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "tests/support/temp_root.h"
@@ -46,44 +48,41 @@ class LineReaderTest : public ::testing::Test {
 };
 
 TEST_F(LineReaderTest, SplitsLinesKeepingEmptyOnesAndTheUnterminatedLast) {
-  struct Case {
-    std::string content;
-    std::vector<std::string> reads;
-  } cases[] = {{"", {}},
-               {"\n", {"L:"}},
-               {"a\n\nb\r\nlast", {"L:a", "L:", "L:b\r", "L:last"}},
-               {std::string("nul\0in\n", 7), {std::string("L:nul\0in", 8)}},
-               // Lines of the maximum or more are skipped, with a preview of their start.
-               {"ok\n0123456789abcdef\n\n", {"L:ok", "T:0123456789abcdef", "L:"}},
-               {"ok\n" + Line(70000, 5), {"L:ok", "T:" + Line(256, 5)}},
-               {"0123456789", {"T:0123456789"}},
-               {"012345678\n", {"L:012345678"}}};
-  for (const auto& c : cases) EXPECT_EQ(ReadAll(c.content, 10), c.reads) << c.content.substr(0, 30);
+  const std::pair<std::string, std::vector<std::string>> cases[] = {
+      {"", {}},
+      {"\n", {"L:"}},
+      {"a\n\nb\r\nlast", {"L:a", "L:", "L:b\r", "L:last"}},
+      {std::string("nul\0in\n", 7), {std::string("L:nul\0in", 8)}},
+      // Lines of the maximum or more are skipped, with a preview of their start.
+      {"ok\n0123456789abcdef\n\n", {"L:ok", "T:0123456789abcdef", "L:"}},
+      {"ok\n" + Line(70000, 5), {"L:ok", "T:" + Line(256, 5)}},
+      {"0123456789", {"T:0123456789"}},
+      {"012345678\n", {"L:012345678"}}};
+  for (const auto& [content, reads] : cases)
+    EXPECT_EQ(ReadAll(content, 10), reads) << content.substr(0, 30);
 }
 
+// Around the read chunk size and the maximum, random ones, and last an
+// unterminated one too long; a line too long gives a preview of its start.
 TEST_F(LineReaderTest, LongLinesAcrossChunkBoundariesComeBackIntactOrSkipped) {
   std::vector<std::string> lines;
-  std::string content;
-  uint32_t r = 7;
   const size_t sizes[] = {65535, 65536, 65537, 0, 131072, 1, kMax - 1, kMax, 3 * kMax + 12345};
   for (size_t size : sizes) lines.push_back(Line(size, static_cast<unsigned>(size)));
-  while (lines.size() < 200) {
+  for (uint32_t r = 7; lines.size() < 200;) {
     r = r * 1103515245u + 12345u;
     lines.push_back(Line((r >> 8) % ((r & 1) ? 300 : 90000), static_cast<unsigned>(lines.size())));
   }
+  lines.push_back(Line(kMax + 1, 4));
+  std::string content;
   for (const auto& line : lines) content += line + "\n";
-  const auto reads = ReadAll(content + Line(kMax + 1, 4));
-  ASSERT_EQ(reads.size(), lines.size() + 1);
+  content.pop_back();
+  const auto reads = ReadAll(content);
+  ASSERT_EQ(reads.size(), lines.size());
   for (size_t i = 0; i < reads.size(); ++i) {
-    const std::string& line = i < lines.size() ? lines[i] : Line(kMax + 1, 4);
-    if (line.size() < kMax) {
-      ASSERT_TRUE(reads[i] == "L:" + line) << "line " << i << " of " << line.size() << " bytes";
-    } else {
-      EXPECT_EQ(reads[i].substr(0, 3), "T:" + line.substr(0, 1))
-          << "line " << i << " of " << line.size();
-      EXPECT_EQ(line.compare(0, reads[i].size() - 2, reads[i].substr(2)), 0)
-          << "preview of line " << i << " is not its start";
-    }
+    const std::string& line = lines[i];
+    const size_t preview = std::max<size_t>(reads[i].size(), 3) - 2;
+    ASSERT_TRUE(reads[i] == (line.size() < kMax ? "L:" + line : "T:" + line.substr(0, preview)))
+        << "line " << i << " of " << line.size() << " bytes";
   }
 }
 

@@ -1,13 +1,14 @@
 #include "common/lock_file.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <filesystem>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "common/root_path.h"
@@ -31,13 +32,11 @@ bool OtherCanLock(const std::string& path, int op) {
 // The descriptors of this process that refer to `path`.
 std::vector<int> DescriptorsOf(const std::string& path) {
   std::vector<int> fds;
-  DIR* d = opendir("/proc/self/fd");
-  while (dirent* e = readdir(d)) {
-    char buf[4096];
-    ssize_t n = readlinkat(dirfd(d), e->d_name, buf, sizeof(buf));
-    if (n > 0 && std::string(buf, n) == path) fds.push_back(atoi(e->d_name));
+  for (const auto& e : std::filesystem::directory_iterator("/proc/self/fd")) {
+    std::error_code ec;
+    if (std::filesystem::read_symlink(e.path(), ec) == path)
+      fds.push_back(std::stoi(e.path().filename()));
   }
-  closedir(d);
   return fds;
 }
 
@@ -71,50 +70,46 @@ TEST_F(LockFileTest, CreatesAMissingFileCloseOnExecAndHoldsItUntilReleased) {
   EXPECT_TRUE(platform_.USleeps().empty());
 }
 
+// A lock held elsewhere (shared or exclusive, by the flock kinds) and wanted
+// shared or exclusively: only shared with shared combines; the rest retries
+// 64 times, each after a random wait of whole tenths below a second.
 TEST_F(LockFileTest, SharedLocksCombineAndEverythingElseWaitsThenGivesUp) {
-  struct Case {
-    int held;
-    bool exclusive, locks;
-  } cases[] = {{LOCK_SH, false, true},
-               {LOCK_SH, true, false},
-               {LOCK_EX, false, false},
-               {LOCK_EX, true, false}};
-  for (const auto& c : cases) {
+  const std::tuple<int, bool, bool> cases[] = {{LOCK_SH, false, true},
+                                               {LOCK_SH, true, false},
+                                               {LOCK_EX, false, false},
+                                               {LOCK_EX, true, false}};
+  for (const auto& [held, exclusive, locks] : cases) {
     int other = open(path_.c_str(), O_RDONLY | O_CREAT | O_CLOEXEC, 0644);
-    ASSERT_EQ(flock(other, c.held | LOCK_NB), 0);
+    ASSERT_EQ(flock(other, held | LOCK_NB), 0);
     platform_.SetRandValues({0, 9, 10, 25, 7, 2147483647});
     const size_t sleeps_before = platform_.USleeps().size();
-    const std::string context = std::string(c.held == LOCK_SH ? "held shared" : "held exclusive") +
-                                (c.exclusive ? ", exclusive wanted" : ", shared wanted");
-    EXPECT_EQ(Failure(path_, c.exclusive),
-              c.locks ? "no error" : "506 Exceed max retry, path=" + path_)
+    const std::string context =
+        "held " + std::to_string(held) + ", exclusive wanted " + std::to_string(exclusive);
+    EXPECT_EQ(Failure(path_, exclusive), locks ? "no error" : "506 Exceed max retry, path=" + path_)
         << context;
     const auto sleeps = platform_.USleeps();
-    ASSERT_EQ(sleeps.size() - sleeps_before, c.locks ? 0u : 64u) << context;
-    for (size_t i = sleeps_before; i < sleeps.size(); ++i) {
+    ASSERT_EQ(sleeps.size() - sleeps_before, locks ? 0u : 64u) << context;
+    for (size_t i = sleeps_before; i < sleeps.size(); ++i)
       ASSERT_TRUE(sleeps[i] % 100000 == 0 && sleeps[i] < 1000000) << sleeps[i];
-    }
     EXPECT_EQ(DescriptorsOf(path_).size(), 1u) << context << ": a failed attempt leaked";
     close(other);
   }
 }
 
 TEST_F(LockFileTest, MissingFolderPlantedLinkOrFifoFailAtOnceUntouched) {
-  const std::string target = root_.Path("/tmp/precious");
+  const std::string target = root_.Path("/tmp/precious"),
+                    dangling = root_.Path("/tmp/dangling.lock"),
+                    fifo = root_.Path("/tmp/fifo.lock"), missing = root_.Path("/missing/x.lock");
   testing::WriteFile(target, "keep me");
   ASSERT_EQ(chmod(target.c_str(), 0600), 0);
   ASSERT_EQ(symlink(target.c_str(), path_.c_str()), 0);
-  const std::string dangling = root_.Path("/tmp/dangling.lock");
   ASSERT_EQ(symlink(root_.Path("/tmp/made-through-link").c_str(), dangling.c_str()), 0);
-  const std::string fifo = root_.Path("/tmp/fifo.lock");
   ASSERT_EQ(mkfifo(fifo.c_str(), 0644), 0);
-  const std::string missing = root_.Path("/missing/x.lock");
   EXPECT_EQ(Failure(missing, true),
             "506 open failed, path=" + missing + ", reason=No such file or directory");
   EXPECT_EQ(platform_.LogsContaining("Failed [").size(), 1u);
-  for (const std::string& p : {path_, dangling, fifo}) {
+  for (const std::string& p : {path_, dangling, fifo})
     EXPECT_EQ(Failure(p, true).rfind("506 open failed, path=" + p + ", reason=", 0), 0u) << p;
-  }
   EXPECT_TRUE(platform_.USleeps().empty());
   EXPECT_EQ(testing::ReadFile(target), "keep me");
   struct stat st;

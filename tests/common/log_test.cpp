@@ -14,8 +14,7 @@ namespace {
 
 int reason_evaluations = 0;
 
-// Counts its calls and disturbs errno, as a reason built from system calls
-// may.
+// Counts its calls and disturbs errno, as a reason built from system calls may.
 std::string CountedReason(const std::string& text) {
   ++reason_evaluations;
   errno = EPERM;
@@ -29,22 +28,20 @@ void CheckPositive(int value) {
 class LogTest : public ::testing::Test {
  protected:
   // The lines logged since the last call, as "<priority> <text>" without
-  // the "log_test.cpp:<line> " prefix, and "(<pid>, <euid>) " shown as "(P) ".
+  // the "log_test.cpp:<line> " prefix.
   std::vector<std::string> TakeLines() {
-    const std::string process =
-        "(" + std::to_string(getpid()) + ", " + std::to_string(geteuid()) + ") ";
     std::vector<std::string> out;
-    for (const auto& l : platform_.Logs()) {
-      std::string text = l.text;
-      if (size_t at = text.find(process); at != std::string::npos)
-        text.replace(at, process.size(), "(P) ");
-      if (text.rfind("log_test.cpp:", 0) == 0) text.erase(0, text.find(' ') + 1);
-      out.push_back(std::to_string(l.priority) + " " + text);
+    for (auto l : platform_.Logs()) {
+      if (l.text.rfind("log_test.cpp:", 0) == 0) l.text.erase(0, l.text.find(' ') + 1);
+      out.push_back(std::to_string(l.priority) + " " + l.text);
     }
     platform_.ClearLogs();
     return out;
   }
 
+  // "(<pid>, <euid>) ", as the lines about a failure have it.
+  const std::string process_ =
+      "(" + std::to_string(getpid()) + ", " + std::to_string(geteuid()) + ") ";
   testing::FakePlatform platform_;
   testing::ScopedPlatform scoped_{&platform_};
 };
@@ -53,9 +50,9 @@ TEST_F(LogTest, ThrowIfLogsTheFailedConditionWithErrnoAndThrows) {
   errno = ENOENT;
   EXPECT_EQ(testing::Thrown([] { CheckPositive(-3); }), "502 value=-3");
   EXPECT_EQ(errno, 0);
-  EXPECT_EQ(TakeLines(), std::vector<std::string>{
-                             "3 (P) (CheckPositive) Failed [value <= 0], reason: value=-3 [err: No "
-                             "such file or directory]"});
+  EXPECT_EQ(TakeLines(), std::vector<std::string>{"3 " + process_ +
+                                                  "(CheckPositive) Failed [value <= 0], reason: "
+                                                  "value=-3 [err: No such file or directory]"});
   reason_evaluations = 0;
   errno = EAGAIN;
   EXPECT_NO_THROW(CheckPositive(1));
@@ -75,9 +72,10 @@ TEST_F(LogTest, ErrnoLinesResetErrnoPlainLinesKeepIt) {
   errno = 0;
   VELLIS_LOG_ERRNO("no error");
   VELLIS_LOG_DEBUG("hidden below the debug level");
-  EXPECT_EQ(TakeLines(), (std::vector<std::string>{
-                             "3 (P) (TestBody) open /x, mode=644 [err: Permission denied]",
-                             "3 text=" + long_text + " end", "3 (P) (TestBody) no error"}));
+  EXPECT_EQ(TakeLines(),
+            (std::vector<std::string>{
+                "3 " + process_ + "(TestBody) open /x, mode=644 [err: Permission denied]",
+                "3 text=" + long_text + " end", "3 " + process_ + "(TestBody) no error"}));
 }
 
 TEST(ErrorTest, MessageNamesTheCodeAndTheReasonWhatOnlyTheReason) {

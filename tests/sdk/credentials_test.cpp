@@ -16,8 +16,6 @@
 namespace vellis::sdk {
 namespace {
 
-using Names = std::vector<std::string>;
-
 class CredentialsTest : public ::testing::Test {
  protected:
   void SetUp() override {
@@ -54,7 +52,8 @@ TEST_F(CredentialsTest, SwitchesToTheUserForTheScopeOnlyAndAdministratorsToRoot)
     SDKCredentials creds("nobody");
     EXPECT_EQ(geteuid(), 0u) << "administrators become root";
   }
-  EXPECT_EQ(platform_.Resets(), (Names{"nobody", "root", "root"})) << "no switch back for them";
+  EXPECT_EQ(platform_.Resets(), (std::vector<std::string>{"nobody", "root", "root"}))
+      << "no switch back for administrators";
 }
 
 TEST_F(CredentialsTest, FailedSwitchIsError503AndKeepsTheIds) {

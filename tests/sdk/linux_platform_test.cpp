@@ -1,5 +1,3 @@
-// The Linux platform's own answers: file-system types, the process runner,
-// free space, users and groups, and text comparison.
 #include "sdk/linux/linux_platform.h"
 
 #include <fcntl.h>
@@ -11,8 +9,12 @@
 
 #include <cerrno>
 #include <cstdlib>
+#include <filesystem>
 #include <string>
 #include <thread>
+#include <tuple>
+#include <utility>
+#include <vector>
 
 #include "sdk/linux/file_systems.h"
 #include "sdk/linux/process.h"
@@ -23,29 +25,26 @@ namespace vellis::sdk {
 namespace {
 
 TEST(FsTypeFromMagicTest, MapsMagicNumbersAndSystemTmpfs) {
-  struct Case {
-    uint64_t magic;
-    std::string path;
-    int type;
-    char kind;  // l(ocal), r(emote), i(mage)
-  } cases[] = {{0xEF53, "/volume1", kFsExt, 'l'},
-               {0xFFFFFFFF9123683EULL, "/volume1", kFsBtrfs, 'l'},  // sign-extended f_type
-               {0x01021994, "/tmp", kFsTmpfs, 'l'},
-               {0x01021994, "/run", kFsPseudo, 'l'},
-               {0x01021994, "/dev/shm", kFsPseudo, 'l'},
-               {0x01021994, "/sys/fs/cgroup", kFsPseudo, 'l'},
-               {0x01021994, "/running", kFsTmpfs, 'l'},  // a sibling of /run, not below it
-               {0x9FA0, "/proc", kFsPseudo, 'l'},
-               {0x6969, "/mnt/nfs", kFsNfs, 'r'},
-               {0x73757245, "/mnt/coda", kFsCoda, 'r'},
-               {0x9660, "/media/cdrom", kFsIso9660, 'i'},
-               {0x7275, "/mnt/romfs", kFsRomfs, 'i'},
-               {0x12345678, "/mnt/odd", kFsOther, 'l'}};
-  for (const Case& c : cases) {
-    const int type = FsTypeFromMagic(c.magic, c.path);
-    EXPECT_EQ(type, c.type) << std::hex << c.magic << " " << c.path;
-    EXPECT_EQ(IsRemoteFsType(type), c.kind == 'r') << c.path;
-    EXPECT_EQ(IsImageFsType(type), c.kind == 'i') << c.path;
+  // The magic number, the path, the type and its kind: l(ocal), r(emote), i(mage).
+  const std::tuple<uint64_t, const char*, int, char> cases[] = {
+      {0xEF53, "/volume1", kFsExt, 'l'},
+      {0xFFFFFFFF9123683EULL, "/volume1", kFsBtrfs, 'l'},  // sign-extended f_type
+      {0x01021994, "/tmp", kFsTmpfs, 'l'},
+      {0x01021994, "/run", kFsPseudo, 'l'},
+      {0x01021994, "/dev/shm", kFsPseudo, 'l'},
+      {0x01021994, "/sys/fs/cgroup", kFsPseudo, 'l'},
+      {0x01021994, "/running", kFsTmpfs, 'l'},  // a sibling of /run, not below it
+      {0x9FA0, "/proc", kFsPseudo, 'l'},
+      {0x6969, "/mnt/nfs", kFsNfs, 'r'},
+      {0x73757245, "/mnt/coda", kFsCoda, 'r'},
+      {0x9660, "/media/cdrom", kFsIso9660, 'i'},
+      {0x7275, "/mnt/romfs", kFsRomfs, 'i'},
+      {0x12345678, "/mnt/odd", kFsOther, 'l'}};
+  for (const auto& [magic, path, type, kind] : cases) {
+    const int got = FsTypeFromMagic(magic, path);
+    EXPECT_EQ(got, type) << std::hex << magic << " " << path;
+    EXPECT_EQ(IsRemoteFsType(got), kind == 'r') << path;
+    EXPECT_EQ(IsImageFsType(got), kind == 'i') << path;
   }
 }
 
@@ -77,16 +76,12 @@ TEST_F(LinuxPlatformTest, RunnerPassesArgumentsVerbatimAndLeaksNoDescriptor) {
   int fd = open("/dev/null", O_RDONLY);  // deliberately without O_CLOEXEC
   ASSERT_GE(fd, 3);
   const std::string probe = "test -e /proc/self/fd/" + std::to_string(fd);
-  struct Case {
-    std::vector<std::string> args;
-    int status;
-  } cases[] = {
+  const std::pair<std::vector<std::string>, int> cases[] = {
       {{"-c", "exit 3"}, 3},        {{"-c", "test \"$1\" = 'a b;c $HOME'", "sh", "a b;c $HOME"}, 0},
       {{"-c", "test $# -eq 0"}, 0}, {{"-c", "read line"}, 1},  // standard input is /dev/null
       {{"-c", "kill -9 $$"}, -1},   {{"-c", probe}, 1}};
-  for (const Case& c : cases) {
-    EXPECT_EQ(platform_.QLIBCExec("/bin/sh", c.args), c.status) << c.args.back();
-  }
+  for (const auto& [args, status] : cases)
+    EXPECT_EQ(platform_.QLIBCExec("/bin/sh", args), status) << args.back();
   EXPECT_EQ(platform_.QLIBCExecl("/bin/sh", kExecStdoutToNull | kExecStderrToNull,
                                  {"-c", "echo hidden; " + probe}),
             1);
@@ -101,51 +96,41 @@ TEST_F(LinuxPlatformTest, NotifierIsFoundByEnvironmentOrBesideTheProgram) {
   setenv(kNotifierEnv, "/opt/x/notify", 1);
   EXPECT_EQ(MapProgram(kHmxNotifyProgram), "/opt/x/notify");
   unsetenv(kNotifierEnv);
-  char exe[4096];
-  ssize_t n = readlink("/proc/self/exe", exe, sizeof(exe) - 1);
-  ASSERT_GT(n, 0);
-  std::string self(exe, static_cast<size_t>(n));
-  EXPECT_EQ(MapProgram(kHmxNotifyProgram), self.substr(0, self.rfind('/')) + "/vellis-notify");
+  EXPECT_EQ(
+      MapProgram(kHmxNotifyProgram),
+      std::filesystem::read_symlink("/proc/self/exe").parent_path().string() + "/vellis-notify");
 }
 
+// Text that is not UTF-8 ("bad\xFF") compares as bytes.
 TEST_F(LinuxPlatformTest, CaseInsensitiveUtf8Comparison) {
-  struct Case {
-    std::string a, b;
-    int sign;
-  } cases[] = {
+  const std::tuple<const char*, const char*, int> cases[] = {
       {"photo", "PHOTO", 0},
       {"Stra\xC3\x9F\x65", "STRASSE", 0},
       {"\xC3\x89t\xC3\xA9", "\xC3\xA9T\xC3\x89", 0},
       {"a", "B", -1},
       {"b", "A", 1},
       {"photo", "photo2", -1},
-      {"bad\xFF", "BAD\xFF", 1},  // not UTF-8: bytes
-  };
-  for (const Case& c : cases) {
-    int got = platform_.QLIBCUnicodeUTF8StrCaseCmp(c.a, c.b);
-    EXPECT_EQ((got > 0) - (got < 0), c.sign) << c.a << " vs " << c.b;
+      {"bad\xFF", "BAD\xFF", 1}};
+  for (const auto& [a, b, sign] : cases) {
+    int got = platform_.QLIBCUnicodeUTF8StrCaseCmp(a, b);
+    EXPECT_EQ((got > 0) - (got < 0), sign) << a << " vs " << b;
   }
 }
 
 TEST_F(LinuxPlatformTest, UserPrivilegeFollowsTheShareFolderBits) {
   if (geteuid() != 0) GTEST_SKIP() << "needs root to own the folders";
-  struct Case {
-    mode_t mode;
-    std::string user;
-    int priv;
-  } cases[] = {{0700, "nobody", kSharePrivNoAccess},
-               {0755, "nobody", kSharePrivReadOnly},
-               {0751, "nobody", kSharePrivNoAccess},
-               {0777, "nobody", kSharePrivReadWrite},
-               {0700, "root", kSharePrivReadWrite}};
+  const std::tuple<mode_t, const char*, int> cases[] = {{0700, "nobody", kSharePrivNoAccess},
+                                                        {0755, "nobody", kSharePrivReadOnly},
+                                                        {0751, "nobody", kSharePrivNoAccess},
+                                                        {0777, "nobody", kSharePrivReadWrite},
+                                                        {0700, "root", kSharePrivReadWrite}};
   ShareInfo share;
-  for (const Case& c : cases) {
-    share.szName = "s" + std::to_string(c.mode);
+  for (const auto& [mode, user, priv] : cases) {
+    share.szName = "s" + std::to_string(mode);
     share.szPath = root_.Path("/volume1/" + share.szName);
     testing::MakeDirs(share.szPath);
-    ASSERT_EQ(0, chmod(share.szPath.c_str(), c.mode));
-    EXPECT_EQ(platform_.QORUShareUserPrivGet(c.user, share), c.priv)
-        << std::oct << c.mode << " " << c.user;
+    ASSERT_EQ(0, chmod(share.szPath.c_str(), mode));
+    EXPECT_EQ(platform_.QORUShareUserPrivGet(user, share), priv) << std::oct << mode << " " << user;
   }
   EXPECT_LT(platform_.QORUShareUserPrivGet("no-such-user-vellis", share), 0);
 }

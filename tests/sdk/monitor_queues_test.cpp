@@ -5,25 +5,20 @@
 
 #include <cerrno>
 #include <string>
+#include <tuple>
 
 #include "sdk/linux/linux_platform.h"
 #include "tests/support/fake_platform.h"
+#include "tests/support/parse_json.h"
 #include "tests/support/temp_root.h"
 
 namespace vellis::sdk {
 namespace {
 
+// A request to watch `path` into `queue`.
 Json::Value Queue(const std::string& queue, const std::string& path) {
-  Json::Value q(Json::objectValue);
-  q["queue"] = queue;
-  q["config"] = Json::Value(Json::arrayValue);
-  if (!path.empty()) {
-    Json::Value& item = q["config"].append(Json::objectValue);
-    item["path"] = path;
-    item["mask"] = 65478;
-    item["ignore"].append("@eaDir");
-  }
-  return q;
+  return testing::ParseJson(R"({"queue":")" + queue + R"(","config":[{"path":")" + path +
+                            R"(","mask":65478,"ignore":["@eaDir"]}]})");
 }
 
 class MonitorQueuesTest : public ::testing::Test {
@@ -36,27 +31,22 @@ class MonitorQueuesTest : public ::testing::Test {
 };
 
 TEST_F(MonitorQueuesTest, BadRequestsAreRefusedAndWriteNothing) {
-  Json::Value no_mask = Queue("/q", "/p");
+  Json::Value no_mask = Queue("/q", "/p"), bad_ignore = Queue("/q", "/p");
   no_mask["config"][0].removeMember("mask");
-  Json::Value bad_ignore = Queue("/q", "/p");
   bad_ignore["config"][0]["ignore"].append(3);
-  struct Case {
-    const char* what;
-    Json::Value queue;
-    std::string app;
-    int type;
-  } cases[] = {{"not an object", Json::Value("q"), "fileindex", 1},
-               {"relative queue", Queue("q", "/p"), "fileindex", 1},
-               {"relative folder", Queue("/q", "p"), "fileindex", 1},
-               {"no mask", no_mask, "fileindex", 1},
-               {"an ignore that is not a string", bad_ignore, "fileindex", 1},
-               {"no application", Queue("/q", "/p"), "", 1},
-               {"application with a slash", Queue("/q", "/p"), "../etc", 1},
-               {"application ..", Queue("/q", "/p"), "..", 1},
-               {"queue type 0", Queue("/q", "/p"), "fileindex", 0}};
-  for (const Case& c : cases) {
-    EXPECT_FALSE(linux_.MonitorQueueUpsert(c.queue, c.app, c.type)) << c.what;
-    EXPECT_EQ(linux_.QLIBCErrGet(), EINVAL) << c.what;
+  const std::tuple<const char*, Json::Value, std::string, int> cases[] = {
+      {"not an object", Json::Value("q"), "fileindex", 1},
+      {"relative queue", Queue("q", "/p"), "fileindex", 1},
+      {"relative folder", Queue("/q", "p"), "fileindex", 1},
+      {"no mask", no_mask, "fileindex", 1},
+      {"an ignore that is not a string", bad_ignore, "fileindex", 1},
+      {"no application", Queue("/q", "/p"), "", 1},
+      {"application with a slash", Queue("/q", "/p"), "../etc", 1},
+      {"application ..", Queue("/q", "/p"), "..", 1},
+      {"queue type 0", Queue("/q", "/p"), "fileindex", 0}};
+  for (const auto& [what, queue, app, type] : cases) {
+    EXPECT_FALSE(linux_.MonitorQueueUpsert(queue, app, type)) << what;
+    EXPECT_EQ(linux_.QLIBCErrGet(), EINVAL) << what;
   }
   EXPECT_FALSE(linux_.MonitorQueueDelete("relative", "fileindex", 1));
   EXPECT_EQ(MonitorQueueFile("../etc"), "");

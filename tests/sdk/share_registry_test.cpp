@@ -1,12 +1,10 @@
-// Registering shares with the Linux platform: bad names and paths are
-// refused with a clear reason and the registry is never damaged.
 #include "sdk/linux/share_registry.h"
 
 #include <gtest/gtest.h>
 #include <unistd.h>
 
 #include <string>
-#include <vector>
+#include <tuple>
 
 #include "common/root_path.h"
 #include "sdk/share.h"
@@ -41,9 +39,7 @@ TEST_F(ShareRegistryTest, BadNamesAndPathsAreRefusedWithTheirReason) {
   testing::MakeDirs(v_ + "/real/music");
   ASSERT_EQ(0, symlink((v_ + "/real").c_str(), (v_ + "/linked").c_str()));
   testing::MakeDirs(v_ + "/other/Photo");
-  struct Case {
-    std::string name, path, reason_start;
-  } cases[] = {
+  const std::tuple<std::string, std::string, std::string> cases[] = {
       {"", v_ + "/", "share name is empty"},
       {".", v_ + "/.", "share name may not be \".\""},
       {"..", v_ + "/..", "share name may not be \"..\""},
@@ -68,10 +64,8 @@ TEST_F(ShareRegistryTest, BadNamesAndPathsAreRefusedWithTheirReason) {
       {"inner", v_ + "/photo/inner", "share path " + v_ + "/photo/inner overlaps share"},
       {"volume1", v_, "share path " + v_ + " overlaps share"}};
   const std::string before = RegistryText();
-  for (const Case& c : cases) {
-    const std::string got = Register(c.name, c.path);
-    EXPECT_EQ(got.substr(0, 4 + c.reason_start.size()), "120 " + c.reason_start) << got;
-  }
+  for (const auto& [name, path, reason] : cases)
+    EXPECT_EQ(Register(name, path).substr(0, 4 + reason.size()), "120 " + reason) << path;
   EXPECT_EQ(RegistryText(), before);
 }
 

@@ -1,13 +1,11 @@
-// SDKShare: the share queries answered alike by the fake and by the Linux
-// platform's share registry (so that the two cannot drift apart), and its
-// answers when the platform's queries fail or report no space.
 #include "sdk/share.h"
 
 #include <gtest/gtest.h>
 
 #include <cerrno>
-#include <functional>
 #include <string>
+#include <tuple>
+#include <utility>
 #include <vector>
 
 #include "sdk/linux/share_registry.h"
@@ -24,24 +22,20 @@ ShareInfo Share(const std::string& name, const std::string& volume = "/volume1")
   return {name, volume + "/" + name};
 }
 
-// Runs against the fake (false) and the real registry (true).
+// Runs against the fake (false) and the real registry (true), so that the
+// two cannot drift apart.
 class ShareContractTest : public ::testing::TestWithParam<bool> {
  protected:
   void SetUp() override {
-    ShareInfo locked = Share("locked", volume_), ro = Share("ro", volume_),
-              bin = Share("bin", volume_);
-    locked.encryption = true;
-    ro.read_only = true;
-    bin.recycle_bin = bin.hide_unreadable = true;
-    bin.ftp_privilege = 7;
-    for (const ShareInfo& s :
-         {Share("photo", volume_), Share("photo2", volume_), locked, ro, bin}) {
-      if (GetParam()) {
-        testing::MakeDirs(s.szPath);
-        RegisterShare(s);
-      } else {
-        fake_.AddShare(s);
-      }
+    // Name, path, FTP word, read only, encryption, recycle bin, hiding unreadable.
+    const ShareInfo shares[] = {{"photo", volume_ + "/photo"},
+                                {"photo2", volume_ + "/photo2"},
+                                {"locked", volume_ + "/locked", 0, false, true},
+                                {"ro", volume_ + "/ro", 0, true},
+                                {"bin", volume_ + "/bin", 7, false, false, true, true}};
+    for (const ShareInfo& s : shares) {
+      testing::MakeDirs(s.szPath);
+      GetParam() ? RegisterShare(s) : fake_.AddShare(s);
     }
   }
 
@@ -63,31 +57,28 @@ class ShareContractTest : public ::testing::TestWithParam<bool> {
 };
 
 TEST_P(ShareContractTest, RecordsCarryTheirSettingsInRegistrationOrder) {
-  struct Case {
-    std::string name;
-    bool can_be_indexed, encryption, recycle_bin, hide_unreadable;
-    int ftp;
-  } cases[] = {{"photo", true, false, false, false, 0},
-               {"ro", false, false, false, false, 0},
-               {"locked", false, true, false, false, 0},  // encrypted and not mounted: locked
-               {"bin", true, false, true, true, 7}};
-  for (const Case& c : cases) {
-    SDKShare share(c.name);
-    EXPECT_EQ(share.GetPath(), volume_ + "/" + c.name);
-    EXPECT_EQ(share.CanBeIndexed(), c.can_be_indexed) << c.name;
-    EXPECT_EQ(share.IsEncryption(), c.encryption) << c.name;
-    EXPECT_EQ(share.IsEnableRecycleBin(), c.recycle_bin) << c.name;
-    EXPECT_EQ(share.IsHideUnReadable(), c.hide_unreadable) << c.name;
-    EXPECT_EQ(share.GetFTPPrivilege(), c.ftp) << c.name;
+  auto settings = [](const SDKShare& s) {
+    return std::string(s.CanBeIndexed() ? "indexable " : "") +
+           (s.IsEncryption() ? "encrypted " : "") + (s.IsEnableRecycleBin() ? "recycle-bin " : "") +
+           (s.IsHideUnReadable() ? "hides " : "") + "ftp=" + std::to_string(s.GetFTPPrivilege());
+  };
+  const std::pair<std::string, std::string> cases[] = {
+      {"photo", "indexable ftp=0"},
+      {"ro", "ftp=0"},
+      {"locked", "encrypted ftp=0"},  // encrypted and not mounted: locked
+      {"bin", "indexable recycle-bin hides ftp=7"}};
+  for (const auto& [name, expected] : cases) {
+    SDKShare share(name);
+    EXPECT_EQ(share.GetPath(), volume_ + "/" + name);
+    EXPECT_EQ(settings(share), expected) << name;
   }
   EXPECT_EQ(SDKShare::Enum(), (std::vector<std::string>{"photo", "photo2", "locked", "ro", "bin"}));
 }
 
 TEST_P(ShareContractTest, UnknownShareIsError800) {
-  for (const std::string& name :
-       {std::string("nosuch"), std::string("Photo"), std::string(""), std::string("photo\0x", 7)}) {
+  using namespace std::string_literals;
+  for (const std::string& name : {"nosuch"s, "Photo"s, ""s, "photo\0x"s})
     EXPECT_EQ(Thrown([&] { SDKShare share(name); }).substr(0, 4), "800 ") << name;
-  }
 }
 
 TEST_P(ShareContractTest, IndexPathsAreStableDistinctAndOutsideEveryShare) {
@@ -101,17 +92,16 @@ TEST_P(ShareContractTest, IndexPathsAreStableDistinctAndOutsideEveryShare) {
 }
 
 TEST_P(ShareContractTest, HolderOfAFullPathGoesByWholeComponents) {
-  struct Case {
-    std::string full_path, holder;
-  } cases[] = {{volume_ + "/photo", "photo|" + volume_ + "/photo"},
-               {volume_ + "/photo/2019/a.jpg", "photo|" + volume_ + "/photo"},
-               {volume_ + "/photo2/a.jpg", "photo2|" + volume_ + "/photo2"},
-               {volume_ + "/photo3/a.jpg", "fails"},
-               {volume_ + "/pho", "fails"},
-               {volume_, "fails"},
-               {"", "fails"},
-               {"photo/a.jpg", "fails"}};
-  for (const Case& c : cases) EXPECT_EQ(Holder(c.full_path), c.holder) << c.full_path;
+  const std::pair<std::string, std::string> cases[] = {
+      {volume_ + "/photo", "photo|" + volume_ + "/photo"},
+      {volume_ + "/photo/2019/a.jpg", "photo|" + volume_ + "/photo"},
+      {volume_ + "/photo2/a.jpg", "photo2|" + volume_ + "/photo2"},
+      {volume_ + "/photo3/a.jpg", "fails"},
+      {volume_ + "/pho", "fails"},
+      {volume_, "fails"},
+      {"", "fails"},
+      {"photo/a.jpg", "fails"}};
+  for (const auto& [full_path, holder] : cases) EXPECT_EQ(Holder(full_path), holder) << full_path;
   EXPECT_EQ(Holder(volume_ + "/photo/a", 3), "fails") << "the name does not fit the buffer";
 }
 
@@ -129,29 +119,22 @@ class ShareTest : public ::testing::Test {
 };
 
 TEST_F(ShareTest, OnlyTheTwoNoSpaceErrorsMeanNoSpace) {
-  struct Case {
-    bool enough;
-    int err;
-    bool expected;
-  } cases[] = {{true, 0, true},
-               {false, kPlatformErrNoSpace, false},
-               {false, kPlatformErrNoInodes, false},
-               {false, EIO, true},
-               {false, 0, true},
-               {false, 0x2901, true}};
+  const std::tuple<bool, int, bool> cases[] = {{true, 0, true},
+                                               {false, kPlatformErrNoSpace, false},
+                                               {false, kPlatformErrNoInodes, false},
+                                               {false, EIO, true},
+                                               {false, 0, true},
+                                               {false, 0x2901, true}};
   SDKShare share("photo");
-  for (const Case& c : cases) {
-    platform_.SetQuota(c.enough, c.err);
-    EXPECT_EQ(share.IsSpaceEnough(), c.expected) << "enough=" << c.enough << " err=" << c.err;
+  for (const auto& [enough, err, expected] : cases) {
+    platform_.SetQuota(enough, err);
+    EXPECT_EQ(share.IsSpaceEnough(), expected) << "enough=" << enough << " err=" << err;
   }
 }
 
 TEST_F(ShareTest, FailingQueriesThrowWithTheShareName) {
-  struct Case {
-    std::string call;
-    std::function<void(const SDKShare&)> run;
-    std::string error;
-  } cases[] = {
+  using Query = void (*)(const SDKShare&);
+  const std::tuple<const char*, Query, const char*> cases[] = {
       {"QLIBShareIsEncryptedGet", [](const SDKShare& s) { s.CanBeIndexed(); },
        "502 QLIBShareis_encryptedGet failed, share=photo"},
       {"QLIBShareIsReadOnlyGet", [](const SDKShare& s) { s.CanBeIndexed(); },
@@ -162,25 +145,22 @@ TEST_F(ShareTest, FailingQueriesThrowWithTheShareName) {
        "502 FILEIDXGetIndexID failed, share=photo"},
       {"QLIBShareEnum", [](const SDKShare&) { SDKShare::Enum(); }, "121 QLIBShareEnum failed"}};
   SDKShare share("photo");
-  for (const Case& c : cases) {
+  for (const auto& [call, query, error] : cases) {
     platform_.ClearFailures();
-    platform_.FailCall(c.call, EIO);
-    EXPECT_EQ(Thrown([&] { c.run(share); }), c.error) << c.call;
+    platform_.FailCall(call, EIO);
+    EXPECT_EQ(Thrown([&, query = query] { query(share); }), error) << call;
   }
   // These never throw: a failure answers no, or enough space.
   platform_.FailCall("QLIBShareHideUnreadableGet", EIO);
   platform_.FailCall("QORUQuotaIsEnough", EIO);
   EXPECT_FALSE(share.IsHideUnReadable());
   EXPECT_TRUE(share.IsSpaceEnough());
-}
-
-TEST_F(ShareTest, ComposedPathsThatDoNotFitTheirBufferFail) {
+  // A composed path that does not fit its buffer fails alike.
   platform_.AddShare(Share("deep", "/volume1/" + std::string(4070, 'd')));
-  SDKShare share("deep");
-  EXPECT_EQ(Thrown([&] { share.GetQueuePath(); }),
-            "502 FILEIDXQueuePathCompose failed, share=deep");
-  EXPECT_EQ(Thrown([&] { share.GetDBPath(); }), "502 FILEIDXDBPathCompose failed, share=deep");
-  EXPECT_EQ(share.GetDBName(), "fileindex_deep");
+  SDKShare deep("deep");
+  EXPECT_EQ(Thrown([&] { deep.GetQueuePath(); }), "502 FILEIDXQueuePathCompose failed, share=deep");
+  EXPECT_EQ(Thrown([&] { deep.GetDBPath(); }), "502 FILEIDXDBPathCompose failed, share=deep");
+  EXPECT_EQ(deep.GetDBName(), "fileindex_deep");
 }
 
 }  // namespace

@@ -1,5 +1,3 @@
-// The file-sharing service's search switch: the INI edit as a pure function,
-// and the Linux platform reading and changing the real file under the root.
 #include "sdk/linux/smb_conf.h"
 
 #include <gtest/gtest.h>
@@ -20,27 +18,20 @@ using testing::ReadFile;
 using testing::WriteFile;
 
 TEST(IniOptionTest, ReadsTheValueAsTheServiceDoes) {
-  struct Case {
-    const char* text;
-    const char* value;  // "-": absent
-  } cases[] = {{"[global]\n\tspotlight = yes\n", "yes"},
-               {"[Global]\n  Spot Light=No  \n", "No"},
-               {"[global]\n# spotlight = yes\n; spotlight = yes\n", "-"},
-               {"[global]\nspotlight = yes\n[homes]\nspotlight = no\n", "yes"},
-               {"[homes]\nspotlight = yes\n", "-"},
-               {"[global]\nworkgroup = W \\\n  spotlight = yes\n", "-"},
-               {"[global]\nspotlight = \\\nyes\n", "yes"}};
-  for (const Case& c : cases) {
-    EXPECT_EQ(GetIniOption(c.text, "global", "spotlight").value_or("-"), c.value) << c.text;
-  }
+  // The text and the value ("-": absent).
+  const char* cases[][2] = {{"[global]\n\tspotlight = yes\n", "yes"},
+                            {"[Global]\n  Spot Light=No  \n", "No"},
+                            {"[global]\n# spotlight = yes\n; spotlight = yes\n", "-"},
+                            {"[global]\nspotlight = yes\n[homes]\nspotlight = no\n", "yes"},
+                            {"[homes]\nspotlight = yes\n", "-"},
+                            {"[global]\nworkgroup = W \\\n  spotlight = yes\n", "-"},
+                            {"[global]\nspotlight = \\\nyes\n", "yes"}};
+  for (const auto& [text, value] : cases)
+    EXPECT_EQ(GetIniOption(text, "global", "spotlight").value_or("-"), value) << text;
 }
 
 TEST(IniOptionTest, SetsTheOptionKeepingEverythingElse) {
-  struct Case {
-    const char* what;
-    const char* text;
-    const char* expected;
-  } cases[] = {
+  const char* cases[][3] = {
       {"replace in place, keeping indentation",
        "# top\n[global]\n   workgroup = W\n   spotlight = no ; old\n[homes]\n\tpath = /h\n",
        "# top\n[global]\n   workgroup = W\n   spotlight = yes\n[homes]\n\tpath = /h\n"},
@@ -61,49 +52,46 @@ TEST(IniOptionTest, SetsTheOptionKeepingEverythingElse) {
        "[global]\nspotlight = yes\n[global]\nspotlight = yes\n"},
       {"commented-out setting left alone, the new one right after the header",
        "[global]\n;spotlight = no\n", "[global]\n\tspotlight = yes\n;spotlight = no\n"}};
-  for (const Case& c : cases) {
-    std::string out = SetIniOption(c.text, "global", "spotlight", "yes");
-    EXPECT_EQ(out, c.expected) << c.what;
-    EXPECT_EQ(GetIniOption(out, "global", "spotlight").value_or(""), "yes") << c.what;
-    EXPECT_EQ(SetIniOption(out, "global", "spotlight", "yes"), out) << c.what << ": idempotent";
+  for (const auto& [what, text, expected] : cases) {
+    std::string out = SetIniOption(text, "global", "spotlight", "yes");
+    EXPECT_EQ(out, expected) << what;
+    EXPECT_EQ(GetIniOption(out, "global", "spotlight").value_or(""), "yes") << what;
+    EXPECT_EQ(SetIniOption(out, "global", "spotlight", "yes"), out) << what << ": idempotent";
   }
 }
 
-class SmbConfPlatformTest : public ::testing::Test {
- protected:
-  testing::TempRoot root_;
-  testing::FakePlatform fake_;
-  testing::ScopedPlatform scoped_{&fake_};
-  LinuxPlatform linux_;
-  std::string conf_ = root_.Path("/etc/samba/smb.conf");
-};
+// The switch of the Linux platform edits an existing regular configuration
+// in place, keeping its mode, and never makes one up.
+TEST(SmbConfPlatformTest, SwitchingRewritesOnlyTheOptionOfARegularConfiguration) {
+  testing::TempRoot root;
+  testing::FakePlatform fake;
+  testing::ScopedPlatform scoped(&fake);
+  LinuxPlatform platform;
+  const std::string conf = root.Path("/etc/samba/smb.conf");
+  EXPECT_EQ(platform.QORUSMBIsEnableSpotlight(), 0);
+  EXPECT_LT(platform.QORUSMBSetSpotlight(1), 0);
+  EXPECT_EQ(platform.QLIBCErrGet(), ENOENT);
+  EXPECT_EQ(platform.QLIBCErrorGetFile(), "smb_conf.cpp");
+  EXPECT_NE(access(conf.c_str(), F_OK), 0) << "no configuration was made up";
+  testing::MakeDirs(conf);
+  EXPECT_EQ(platform.QORUSMBIsEnableSpotlight(), 0);
+  EXPECT_LT(platform.QORUSMBSetSpotlight(1), 0);
+  EXPECT_EQ(platform.QLIBCErrGet(), EINVAL);
 
-TEST_F(SmbConfPlatformTest, SwitchingRewritesOnlyTheOptionAndKeepsTheMode) {
-  WriteFile(conf_, "# site settings\n[global]\n\tworkgroup = HOME\n[data]\n\tpath = /d\n");
-  ASSERT_EQ(chmod(conf_.c_str(), 0640), 0);
-  EXPECT_EQ(linux_.QORUSMBIsEnableSpotlight(), 0);
-  ASSERT_EQ(linux_.QORUSMBSetSpotlight(1), 0);
-  EXPECT_EQ(linux_.QORUSMBIsEnableSpotlight(), 1);
+  ASSERT_EQ(rmdir(conf.c_str()), 0);
+  WriteFile(conf, "# site settings\n[global]\n\tworkgroup = HOME\n[data]\n\tpath = /d\n");
+  ASSERT_EQ(chmod(conf.c_str(), 0640), 0);
+  EXPECT_EQ(platform.QORUSMBIsEnableSpotlight(), 0);
+  ASSERT_EQ(platform.QORUSMBSetSpotlight(1), 0);
+  EXPECT_EQ(platform.QORUSMBIsEnableSpotlight(), 1);
   EXPECT_EQ(
-      ReadFile(conf_),
+      ReadFile(conf),
       "# site settings\n[global]\n\tworkgroup = HOME\n\tspotlight = yes\n[data]\n\tpath = /d\n");
   struct stat st;
-  ASSERT_EQ(stat(conf_.c_str(), &st), 0);
+  ASSERT_EQ(stat(conf.c_str(), &st), 0);
   EXPECT_EQ(st.st_mode & 07777, 0640u);
-  ASSERT_EQ(linux_.QORUSMBSetSpotlight(0), 0);
-  EXPECT_EQ(linux_.QORUSMBIsEnableSpotlight(), 0);
-}
-
-TEST_F(SmbConfPlatformTest, AMissingOrIrregularConfigurationIsOffAndNotWritten) {
-  EXPECT_EQ(linux_.QORUSMBIsEnableSpotlight(), 0);
-  EXPECT_LT(linux_.QORUSMBSetSpotlight(1), 0);
-  EXPECT_EQ(linux_.QLIBCErrGet(), ENOENT);
-  EXPECT_EQ(linux_.QLIBCErrorGetFile(), "smb_conf.cpp");
-  EXPECT_NE(access(conf_.c_str(), F_OK), 0) << "no configuration was made up";
-  testing::MakeDirs(conf_);
-  EXPECT_EQ(linux_.QORUSMBIsEnableSpotlight(), 0);
-  EXPECT_LT(linux_.QORUSMBSetSpotlight(1), 0);
-  EXPECT_EQ(linux_.QLIBCErrGet(), EINVAL);
+  ASSERT_EQ(platform.QORUSMBSetSpotlight(0), 0);
+  EXPECT_EQ(platform.QORUSMBIsEnableSpotlight(), 0);
 }
 
 }  // namespace

@@ -6,6 +6,7 @@
 // derives from it and overrides just those calls.
 #pragma once
 
+#include <algorithm>
 #include <cstdint>
 #include <mutex>
 #include <string>
@@ -43,13 +44,8 @@ class FakePlatform : public sdk::PlatformWrapper {
   }
   int Rand() override {
     return Locked([&] {
-      if (!rand_values_.empty()) {
-        int v = rand_values_[rand_next_];
-        if (rand_next_ + 1 < rand_values_.size()) ++rand_next_;
-        return v;
-      }
-      lcg_ = lcg_ * 1103515245u + 12345u;
-      return static_cast<int>(lcg_ >> 1);
+      if (rand_values_.empty()) return static_cast<int>((lcg_ = lcg_ * 1103515245u + 12345u) >> 1);
+      return rand_values_[std::min(rand_next_++, rand_values_.size() - 1)];
     });
   }
 

@@ -18,8 +18,7 @@ class FakeServicesPlatform : public FakeSharePlatform {
   // One service request: the call's name ("QLIBServiceStart", ...) and the
   // service.
   struct ServiceCall {
-    std::string call;
-    std::string service;
+    std::string call, service;
     bool operator==(const ServiceCall& o) const { return call == o.call && service == o.service; }
   };
 
@@ -49,20 +48,16 @@ class FakeServicesPlatform : public FakeSharePlatform {
     target()->USleep(microseconds / divisor);
   }
 
-  int QLIBServiceStart(const std::string& service, bool) override {
-    return Service("QLIBServiceStart", service);
+  int QLIBServiceStart(const std::string& s, bool) override {
+    return Service("QLIBServiceStart", s);
   }
-  int QLIBServiceStop(const std::string& service, bool) override {
-    return Service("QLIBServiceStop", service);
+  int QLIBServiceStop(const std::string& s, bool) override { return Service("QLIBServiceStop", s); }
+  int QLIBServiceRestart(const std::string& s) override { return Service("QLIBServiceRestart", s); }
+  int QLIBServicectlStart(const std::string& s, int) override {
+    return Service("QLIBServicectlStart", s);
   }
-  int QLIBServiceRestart(const std::string& service) override {
-    return Service("QLIBServiceRestart", service);
-  }
-  int QLIBServicectlStart(const std::string& service, int) override {
-    return Service("QLIBServicectlStart", service);
-  }
-  int QLIBServicectlStop(const std::string& service, int) override {
-    return Service("QLIBServicectlStop", service);
+  int QLIBServicectlStop(const std::string& s, int) override {
+    return Service("QLIBServicectlStop", s);
   }
   int QORUSMBIsEnableSpotlight() override { return Spotlight() ? 1 : 0; }
   int QORUSMBSetSpotlight(int enable) override {

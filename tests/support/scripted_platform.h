@@ -13,16 +13,12 @@ namespace vellis::testing {
 
 class ScriptedPlatform : public FakeSharePlatform {
  public:
+  using SleepHook = std::function<void(unsigned int seconds, size_t sleeps_so_far)>;
+  using ParseHook = std::function<int(const std::string&, const Json::Value&, Json::Value*)>;
   // Runs `hook` after each Sleep has been recorded (the count includes it).
-  void SetOnSleep(std::function<void(unsigned int seconds, size_t sleeps_so_far)> hook) {
-    on_sleep_ = std::move(hook);
-  }
+  void SetOnSleep(SleepHook hook) { on_sleep_ = std::move(hook); }
   // Answers ParseFile with `hook` instead of the real extraction.
-  void SetParseFile(
-      std::function<int(const std::string& path, const Json::Value& options, Json::Value* doc)>
-          hook) {
-    parse_file_ = std::move(hook);
-  }
+  void SetParseFile(ParseHook hook) { parse_file_ = std::move(hook); }
 
   void Sleep(unsigned int seconds) override {
     FakeSharePlatform::Sleep(seconds);
@@ -34,8 +30,8 @@ class ScriptedPlatform : public FakeSharePlatform {
   }
 
  private:
-  std::function<void(unsigned int, size_t)> on_sleep_;
-  std::function<int(const std::string&, const Json::Value&, Json::Value*)> parse_file_;
+  SleepHook on_sleep_;
+  ParseHook parse_file_;
 };
 
 }  // namespace vellis::testing
