@@ -5,7 +5,7 @@
 
 #include "common/error.h"
 #include "fileindex/index_mgr.h"
-#include "tests/support/index_mgr_env.h"
+#include "tests/support/folder_env.h"
 
 int main(int argc, char** argv) {
   if (argc < 4) return 2;

@@ -24,10 +24,16 @@ namespace vellis::fileindex {
 namespace {
 
 using Strings = std::vector<std::string>;
-using testing::MakeFolder;
 using testing::ParseJson;
 using testing::Thrown;
 using testing::WriteFile;
+
+// A folder record with privileged and paused off.
+std::shared_ptr<Folder> MakeFolder(const std::string& path, const std::string& name = "n",
+                                   bool document = true, bool audio = true, bool video = true,
+                                   bool photo = true) {
+  return std::make_shared<Folder>(path, name, document, audio, video, photo, false, false);
+}
 
 // Optional keys default, and mistyped ones keep their defaults.
 TEST(FolderJsonTest, LoadingAndGetDataAreInverses) {
@@ -46,9 +52,10 @@ TEST(FolderJsonTest, LoadingAndGetDataAreInverses) {
 class FolderMgrTest : public testing::FolderEnvTest {
  protected:
   FolderMgrTest() {
-    for (const char* share : {"music", "musicbox", "photo", "s"}) AddShare(share);
-    testing::MakeDirs(Volume() + "/s/dir");
+    for (const char* share : {"music", "musicbox", "photo"}) AddShare(share);
+    AddShare("s", {"/dir"});
     platform_.SetTime(1700000000);
+    platform_.SetRealUSleep(1);  // for writers that contend for the folder lock
   }
 
   void Add(const std::shared_ptr<Folder>& folder) {
@@ -58,7 +65,7 @@ class FolderMgrTest : public testing::FolderEnvTest {
 
   Strings Saved() {
     Strings paths;
-    for (const Json::Value& f : ParseJson(testing::ReadFile(FoldersFile()))) {
+    for (const Json::Value& f : ParseJson(testing::ReadFile(FoldersPath()))) {
       paths.push_back(f["path"].asString());
     }
     return paths;
@@ -97,7 +104,7 @@ TEST_F(FolderMgrTest, EachStatusTextInOrderOfPrecedence) {
   };
   for (const Case& c : cases) {
     const std::string contents[] = {c.status_file, c.queue, c.queue_tmp};
-    const std::string files[] = {StatusFile(), QueuePath("s"), QueuePath("s") + ".tmp"};
+    const std::string files[] = {StatusPath(), QueuePath("s"), QueuePath("s") + ".tmp"};
     for (int i = 0; i < 3; ++i) {
       Unlink(files[i]);
       if (!contents[i].empty()) WriteFile(files[i], contents[i]);
@@ -117,10 +124,10 @@ TEST_F(FolderMgrTest, EachStatusTextInOrderOfPrecedence) {
 // A killed save's temporary file goes; one that a save under way may own
 // stays; the file is readable by all.
 TEST_F(FolderMgrTest, SaveRemovesOnlyTemporaryFilesOfSavesLongGone) {
-  const std::string stale = FoldersFile() + ".tmp-Ab12Cd", fresh = FoldersFile() + ".tmp-Ef34Gh",
-                    other = FoldersFile() + ".bak";
-  for (const std::string& f : {stale, fresh, other, FoldersFile()}) WriteFile(f, "[");
-  chmod(FoldersFile().c_str(), 0600);
+  const std::string stale = FoldersPath() + ".tmp-Ab12Cd", fresh = FoldersPath() + ".tmp-Ef34Gh",
+                    other = FoldersPath() + ".bak";
+  for (const std::string& f : {stale, fresh, other, FoldersPath()}) WriteFile(f, "[");
+  chmod(FoldersPath().c_str(), 0600);
   struct stat st;
   ASSERT_EQ(stat(fresh.c_str(), &st), 0);
   const timespec times[2] = {{st.st_mtime - 120, 0}, {st.st_mtime - 120, 0}};
@@ -129,7 +136,7 @@ TEST_F(FolderMgrTest, SaveRemovesOnlyTemporaryFilesOfSavesLongGone) {
   mgr_.Save();
   EXPECT_NE(stat(stale.c_str(), &st), 0);
   EXPECT_EQ(stat(fresh.c_str(), &st) + stat(other.c_str(), &st), 0);
-  ASSERT_EQ(stat(FoldersFile().c_str(), &st), 0);
+  ASSERT_EQ(stat(FoldersPath().c_str(), &st), 0);
   EXPECT_EQ(st.st_mode & 07777, 0644u);
 }
 

@@ -13,9 +13,9 @@
 
 #include "common/error.h"
 #include "common/json_util.h"
-#include "fileindex/util.h"
 #include "fileindex/queue_path_filter.h"
 #include "fileindex/status_mgr.h"
+#include "fileindex/util.h"
 #include "tests/support/folder_env.h"
 
 namespace vellis::fileindex {
@@ -125,7 +125,6 @@ TEST_F(QueueMgrTest, BadLinesAreLoggedAndSkippedAndTheRestIsRead) {
   EXPECT_EQ(Round(false), (Strings{"[02] /s/big", "count=1"}));
 }
 
-// A reindex on the path or an ancestor, by whole components.
 TEST_F(QueueMgrTest, FindsAReindexOnThePathOrAnAncestorOnly) {
   struct Case {
     std::string live, side, query;
@@ -202,7 +201,7 @@ TEST_F(QueueMgrTest, AFailedEventIsLoggedAndFlagsItsShare) {
   WriteFile(root_.Path("/target"), "kept\n");
   ASSERT_EQ(symlink(root_.Path("/target").c_str(), queue_.c_str()), 0);
   AddCustomEvent(0x10000, Volume() + "/nosuch/a", "", Json::Value());
-  EXPECT_EQ(access(StatusFile().c_str(), F_OK), -1) << "nothing to flag";
+  EXPECT_EQ(access(StatusPath().c_str(), F_OK), -1) << "nothing to flag";
   AddCustomEvent(0x10000, share_ + "/a", "", Json::Value());
   platform_.FailCall("QORUShareGet", ENOENT, "s");
   AddCustomEvent(0x10000, share_ + "/b", "", Json::Value());
@@ -216,7 +215,7 @@ TEST_F(QueueMgrTest, AFailedEventIsLoggedAndFlagsItsShare) {
 // over; every line turns up exactly once, whole.
 TEST_F(QueueMgrTest, ParallelAppendersRacingTheRotationLoseAndTearNothing) {
   constexpr int kWriters = 4, kEventsEach = 200;
-  platform_.SetUSleepDivisor(100);  // lock retries after 0 to 9 ms
+  platform_.SetRealUSleep(100);  // lock retries after 0 to 9 ms
   std::vector<pid_t> writers;
   for (int w = 0; w < kWriters; ++w) {
     pid_t pid = fork();

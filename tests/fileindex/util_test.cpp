@@ -167,7 +167,6 @@ TEST_F(UtilTest, FileSystemTypesMountPointsAndFailingTests) {
   EXPECT_EQ(Rule(v_ + "/photo/tmp"), "error 800");
 }
 
-// Each costly query is made only for the paths whose text asks for it.
 TEST_F(UtilTest, CostlyQueriesAreMadeOnlyWhenTheTextAsksForThem) {
   for (const auto& [rel, asked] : {std::pair{"/photo/tmp", ""},
                                    {"/photo/#snapshot", "QLIBFhsPathInSnapshot"},

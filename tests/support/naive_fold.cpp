@@ -12,18 +12,18 @@ constexpr int kNone = 0, kDelete = 1, kUpsert = 2, kAttr = 3, kUpdateCfg = 4, kR
               kReindex = 6, kCrash = 7;
 
 // What a new operation does when it meets one pending operation e: nothing
-// (kKeep), or it is cancelled (kDrop) after e becomes an upsert, a delete, a
-// reindex, an update cfg carrying the new data, or merges the new data.
-enum Action { kKeep, kDrop, kToUpsert, kToDelete, kToReindex, kToCfg, kMerge };
+// (kKeep), or it is cancelled after e is left as it is (kDrop), becomes the
+// kind named, takes the new data as well (kUpdateCfg) or merges it (kMerge).
+constexpr int kKeep = -1, kDrop = 0, kMerge = 8;
 // Rows: the handler; columns: e's kind, delete (1) to reindex (6).
 enum Row { kRowCreate, kRowModify, kRowDelete, kRowAttr, kRowUpdateCfg, kRowReindex };
-constexpr Action kTable[6][6] = {
-    /* create  */ {kToUpsert, kDrop, kToUpsert, kDrop, kKeep, kDrop},
-    /* modify  */ {kDrop, kDrop, kToUpsert, kDrop, kKeep, kDrop},
-    /* delete  */ {kDrop, kToDelete, kToDelete, kKeep, kKeep, kKeep},
+constexpr int kTable[6][6] = {
+    /* create  */ {kUpsert, kDrop, kUpsert, kDrop, kKeep, kDrop},
+    /* modify  */ {kDrop, kDrop, kUpsert, kDrop, kKeep, kDrop},
+    /* delete  */ {kDrop, kDelete, kDelete, kKeep, kKeep, kKeep},
     /* attr    */ {kDrop, kDrop, kDrop, kDrop, kKeep, kDrop},
-    /* updcfg  */ {kDrop, kToCfg, kToCfg, kMerge, kKeep, kDrop},
-    /* reindex */ {kDrop, kToReindex, kToReindex, kToReindex, kKeep, kDrop},
+    /* updcfg  */ {kDrop, kUpdateCfg, kUpdateCfg, kMerge, kKeep, kDrop},
+    /* reindex */ {kDrop, kReindex, kReindex, kReindex, kKeep, kDrop},
 };
 
 struct Node {
@@ -42,20 +42,21 @@ struct Op {
 
 class Model {
  public:
-  std::pair<std::vector<NaiveOp>, unsigned> Fold(const std::vector<std::string>& lines) {
+  std::vector<std::string> Fold(const std::vector<std::string>& lines) {
     for (const std::string& line : lines) {
       try {
         if (line.size() < (1u << 20)) InsertEvent(fileindex::Event(line));
       } catch (const Error&) {  // logged and skipped by the tree
       }
-      if (crashed_) return {{NaiveOp{"", kCrash, "", Json::Value()}}, 1};
+      if (crashed_) return {OpText(kCrash, "", "", Json::Value()), "count=1"};
     }
-    std::vector<NaiveOp> out;
+    std::vector<std::string> out;
     for (int o : attached_) {
       const Op& op = ops_[o];
-      if (op.kind != kNone) out.push_back(NaiveOp{PathOf(op.node), op.kind, op.path_old, op.data});
+      if (op.kind != kNone) out.push_back(OpText(op.kind, PathOf(op.node), op.path_old, op.data));
     }
-    return {out, static_cast<unsigned>(attached_.size())};
+    out.push_back("count=" + std::to_string(attached_.size()));
+    return out;
   }
 
  private:
@@ -121,14 +122,11 @@ class Model {
     const size_t n = nodes_[node].ops.size();
     for (size_t i = 0; i < n; ++i) {
       Op& e = ops_[nodes_[node].ops[i]];
-      if (e.kind == kNone || e.kind == kCrash || kTable[row][e.kind - 1] == kKeep) continue;
-      const Action action = kTable[row][e.kind - 1];
-      if (action == kToUpsert) e.kind = kUpsert;
-      if (action == kToDelete) e.kind = kDelete;
-      if (action == kToReindex) e.kind = kReindex;
-      if (action == kToCfg) e.kind = kUpdateCfg;
-      if (action == kToCfg) e.data = ops_[o].data;
+      const int action = e.kind == kNone || e.kind == kCrash ? kKeep : kTable[row][e.kind - 1];
+      if (action == kKeep) continue;
       if (action == kMerge) MergeData(e.data, ops_[o].data);
+      if (action != kDrop && action != kMerge) e.kind = action;
+      if (action == kUpdateCfg) e.data = ops_[o].data;
       ops_[o].kind = kNone;
     }
     if (row == kRowReindex) {
@@ -198,7 +196,13 @@ class Model {
 
 }  // namespace
 
-std::pair<std::vector<NaiveOp>, unsigned> NaiveFold(const std::vector<std::string>& lines) {
+std::string OpText(int kind, const std::string& path, const std::string& path_old,
+                   const Json::Value& data) {
+  return "[" + std::to_string(kind) + "] " + path_old + " -> " + path +
+         ", data=" + JsonToString(data);
+}
+
+std::vector<std::string> NaiveFold(const std::vector<std::string>& lines) {
   return Model().Fold(lines);
 }
 

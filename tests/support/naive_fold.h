@@ -7,24 +7,15 @@
 #include <json/json.h>
 
 #include <string>
-#include <utility>
 #include <vector>
 
 namespace vellis::testing {
 
-// One delivered operation: its node's path, kind (FileIndexOP) and fields.
-struct NaiveOp {
-  std::string path;
-  int kind = 0;
-  std::string path_old;
-  Json::Value data;
+// One delivered operation: "[<kind>] <path_old> -> <path>, data=<json>".
+std::string OpText(int kind, const std::string& path, const std::string& path_old,
+                   const Json::Value& data);
 
-  bool operator==(const NaiveOp& o) const {
-    return path == o.path && kind == o.kind && path_old == o.path_old && data == o.data;
-  }
-};
-
-// What OPTree(lines).ProcessOP delivers, in order, and returns.
-std::pair<std::vector<NaiveOp>, unsigned> NaiveFold(const std::vector<std::string>& lines);
+// What OPTree(lines).ProcessOP delivers, in order, then "count=<what it returns>".
+std::vector<std::string> NaiveFold(const std::vector<std::string>& lines);
 
 }  // namespace vellis::testing

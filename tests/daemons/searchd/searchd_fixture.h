@@ -2,27 +2,25 @@
 // the library's own mappings, as production does.
 #pragma once
 
-#include <stdexcept>
+#include <gtest/gtest.h>
+
 #include <string>
 #include <vector>
 
 #include "common/json_util.h"
 #include "fileindex/elastic/schema.h"
+#include "tests/support/parse_json.h"
 
 namespace vellis::searchd::testing {
 
-inline Json::Value Parse(const std::string& text) {
-  Json::Value v;
-  if (!JsonFromString(v, text)) throw std::runtime_error("bad test JSON: " + text);
-  return v;
-}
+using ::vellis::testing::ParseJson;
 
 // {"command": command, "data": data}, `data` JSON text; index `id` unless it names one.
 inline Json::Value Request(const std::string& command, const std::string& data = "{}",
                            const std::string& id = "s") {
   Json::Value r(Json::objectValue);
   r["command"] = command;
-  r["data"] = Parse(data);
+  r["data"] = ParseJson(data);
   if (!r["data"].isMember("id")) r["data"]["id"] = id;
   return r;
 }
@@ -36,10 +34,9 @@ inline Json::Value CreateRequest(const std::string& id, const std::string& path)
 
 // The upsert of a file's document as the indexer sends it (path, name
 // fields, size 100, date 1000), with the members of `extra` (JSON text).
-inline Json::Value Upsert(const std::string& path, const std::string& extra = "{}",
-                          const std::string& id = "s") {
+inline Json::Value Upsert(const std::string& path, const std::string& extra = "{}") {
   const std::string name = path.substr(path.rfind('/') + 1);
-  Json::Value r = Request("document_upsert_by_id", R"({"data": )" + extra + "}", id);
+  Json::Value r = Request("document_upsert_by_id", R"({"data": )" + extra + "}");
   Json::Value& d = r["data"]["data"];
   d["QORUMDPath"] = r["data"]["doc_id"] = path;
   d["QORUMDFSName"] = d["QORUMDSearchFileName"] = name;
@@ -55,6 +52,13 @@ inline Json::Value Compound(const std::vector<Json::Value>& requests) {
   r["compound"] = Json::arrayValue;
   for (const Json::Value& q : requests) r["compound"].append(q);
   return r;
+}
+
+// The answer's "data" when it succeeded; a test failure otherwise.
+inline Json::Value DataOf(const Json::Value& request, const Json::Value& answer) {
+  EXPECT_TRUE(answer["success"].asBool())
+      << JsonToString(request).substr(0, 300) << "\n-> " << JsonToString(answer);
+  return answer["data"];
 }
 
 // True when `got` has every member of `want` (a missing one counts as null),
