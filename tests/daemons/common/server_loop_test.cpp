@@ -11,7 +11,6 @@
 #include <atomic>
 #include <condition_variable>
 #include <cstring>
-#include <future>
 #include <memory>
 #include <mutex>
 #include <thread>
@@ -19,7 +18,6 @@
 
 #include "common/error.h"
 #include "common/json_util.h"
-#include "common/root_path.h"
 #include "daemons/common/process.h"
 #include "sdk/domain_socket.h"
 #include "sdk/frame.h"
