@@ -38,6 +38,8 @@ for p in "$share/2019" "$share/2019/" "$share/etc-link" "$share/#recycle/x.jpg";
   printf '%s: ' "${p#$VELLIS_ROOT}"
   "$VELLIS" path check "$p" || true
 done
+echo "-- as JSON, with the exit status scripts branch on (1: not indexable)"
+"$VELLIS" path check "$share/#recycle/x.jpg" --json || echo "exit status $?"
 echo "== vellis path type / share"
 "$VELLIS" path type "$share/2019/a.jpg"
 "$VELLIS" path share "$share/2019/a.jpg"
