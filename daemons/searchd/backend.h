@@ -79,10 +79,12 @@ class Engine {
                                  const std::string& prefix) = 0;
   // The documents whose `field` value begins with `prefix`, in identity
   // order, each with the stored fields named in `load_fields` (all when
-  // empty).
+  // empty). With `after`, only identities above it; with `limit` above 0, at
+  // most that many: a caller pages through a large subtree.
   virtual Json::Value GetByPrefix(const std::string& id, const std::string& field,
                                   const std::string& prefix,
-                                  const std::vector<std::string>& load_fields) = 0;
+                                  const std::vector<std::string>& load_fields,
+                                  const std::string& after, int64_t limit) = 0;
   // Makes the index's writes so far durable.
   virtual void Commit(const std::string& id) = 0;
   // Commits every index (on a clean stop), all of them even when one fails;

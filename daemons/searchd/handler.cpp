@@ -5,11 +5,11 @@
 #include <exception>
 
 #include "common/json_util.h"
-#include "sdk/platform.h"
 #include "daemons/searchd/args.h"
 #include "daemons/searchd/error_codes.h"
 #include "daemons/searchd/names.h"
 #include "daemons/searchd/search_request.h"
+#include "sdk/platform.h"
 
 namespace vellis::searchd {
 namespace {
@@ -195,7 +195,10 @@ Json::Value Handler::Dispatch(const std::string& command, const Json::Value& dat
   if (command == "document_get_by_query") {
     std::string id = IndexId(data);
     auto [field, prefix] = PrefixQuery(data);
-    return engine_.GetByPrefix(id, field, prefix, StringList(data, kData, "load_field"));
+    const int64_t limit = OptionalInt(data, kData, "limit").value_or(0);
+    if (limit < 0) throw Error(kErrBadMember, "data.limit must not be negative");
+    return engine_.GetByPrefix(id, field, prefix, StringList(data, kData, "load_field"),
+                               OptionalString(data, kData, "after").value_or(""), limit);
   }
   if (command == "commit") {
     engine_.Commit(IndexId(data));

@@ -207,8 +207,9 @@ int64_t SqliteEngine::DeleteByPrefix(const std::string& id, const std::string& f
 
 Json::Value SqliteEngine::GetByPrefix(const std::string& id, const std::string& field,
                                       const std::string& prefix,
-                                      const std::vector<std::string>& load_fields) {
-  return Open(id).GetByPrefix(field, prefix, load_fields);
+                                      const std::vector<std::string>& load_fields,
+                                      const std::string& after, int64_t limit) {
+  return Open(id).GetByPrefix(field, prefix, load_fields, after, limit);
 }
 
 void SqliteEngine::Commit(const std::string& id) { Open(id).Commit(); }

@@ -41,8 +41,8 @@ class SqliteEngine : public Engine {
   int64_t DeleteByPrefix(const std::string& id, const std::string& field,
                          const std::string& prefix) override;
   Json::Value GetByPrefix(const std::string& id, const std::string& field,
-                          const std::string& prefix,
-                          const std::vector<std::string>& load_fields) override;
+                          const std::string& prefix, const std::vector<std::string>& load_fields,
+                          const std::string& after, int64_t limit) override;
   void Commit(const std::string& id) override;
   void CommitAll() override;
   void UpdateTermSuggestion(const std::string& id, const std::string& doc_id) override;

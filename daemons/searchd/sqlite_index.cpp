@@ -423,15 +423,19 @@ Json::Value SqliteIndex::Project(const Json::Value& doc, const std::vector<std::
 }
 
 Json::Value SqliteIndex::GetByPrefix(const std::string& field, const std::string& prefix,
-                                     const std::vector<std::string>& load_fields) {
+                                     const std::vector<std::string>& load_fields,
+                                     const std::string& after, int64_t limit) {
   CheckPrefixField(field);
   Json::Value out(Json::arrayValue);
   bool want_content = load_fields.empty();
   for (const std::string& f : load_fields) want_content = want_content || f == kContentField;
-  Stmt st(
-      db_->get(),
-      "SELECT rid, body, has_content FROM docs WHERE doc_id >= ? AND doc_id < ? ORDER BY doc_id");
-  st.Bind(1, prefix).Bind(2, PrefixUpperBound(prefix));
+  Stmt st(db_->get(),
+          "SELECT rid, body, has_content FROM docs WHERE doc_id >= ? AND doc_id < ? AND doc_id > ?"
+          " ORDER BY doc_id LIMIT ?");
+  st.Bind(1, prefix)
+      .Bind(2, PrefixUpperBound(prefix))
+      .Bind(3, after)
+      .Bind(4, limit > 0 ? limit : int64_t{-1});
   while (st.Step()) {
     Json::Value doc = RowDocument(st.Text(1), want_content && st.Int(2) != 0, st.Int(0));
     out.append(Project(doc, load_fields, true));

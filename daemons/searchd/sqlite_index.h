@@ -51,7 +51,8 @@ class SqliteIndex {
   bool Delete(const std::string& doc_id);
   int64_t DeleteByPrefix(const std::string& field, const std::string& prefix);
   Json::Value GetByPrefix(const std::string& field, const std::string& prefix,
-                          const std::vector<std::string>& load_fields);
+                          const std::vector<std::string>& load_fields,
+                          const std::string& after = "", int64_t limit = 0);
   // Ends the open transaction. Throws kErrStorage after a rolled-back
   // failure (see above), having committed the writes made since.
   void Commit();

@@ -97,6 +97,11 @@ TEST_F(HandlerTest, DocumentsAreWrittenReadAndDeleted) {
   const std::string get = Query("/v/s/", R"("QORUMDTitle", "QORUMDKeywords", "QORUMDFSSize",
                                              "QORUMDNoSuchField")");
   const std::string set = R"({"doc_id": "/v/s/a.txt", "data": {"QORUMDTitle": "2nd"}})";
+  auto page = [](const std::string& after, int limit) {
+    std::string q = Query("/v/d/", R"("QORUMDPath")");
+    return q.substr(0, q.size() - 1) + R"(, "after": ")" + after + R"(", "limit": )" +
+           std::to_string(limit) + "}";
+  };
   for (const char* p : {"/v/d/a", "/v/d/a/x", "/v/d/a/y/z", "/v/d/ab", "/v/d/ab/w"}) Ok(Upsert(p));
   Script({{Upsert("/v/s/a.txt", R"({"QORUMDTitle": "First", "QORUMDKeywords": "k1"})"), "{}"},
           {Request("document_set_by_id", set), "{}"},
@@ -107,6 +112,13 @@ TEST_F(HandlerTest, DocumentsAreWrittenReadAndDeleted) {
           {Upsert("/v/s/a.txt", R"({"QORUMDFSSize": 20})"), "{}"},
           {Request("document_get_by_query", get),
            R"([{"QORUMDTitle": null, "QORUMDKeywords": null, "QORUMDFSSize": 20}])"},
+          // Pages of a subtree in path (byte) order: after a path, at most n.
+          {Request("document_get_by_query", page("", 2)), R"([{"QORUMDPath": "/v/d/a"},
+                                                              {"QORUMDPath": "/v/d/a/x"}])"},
+          {Request("document_get_by_query", page("/v/d/a/x", 2)),
+           R"([{"QORUMDPath": "/v/d/a/y/z"}, {"QORUMDPath": "/v/d/ab"}])"},
+          {Request("document_get_by_query", page("/v/d/ab/w", 2)), "[]"},
+          {Request("document_get_by_query", page("", -1)), "1102"},
           {Request("document_del_by_query", Query("/v/d/a/")), R"({"deleted": 2})"},
           {Request("document_del_by_id", R"({"doc_id": "/v/d/ab"})"), R"({"deleted": true})"},
           {Request("document_del_by_id", R"({"doc_id": "/v/d/ab"})"), R"({"deleted": false})"}});
