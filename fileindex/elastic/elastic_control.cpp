@@ -4,6 +4,7 @@
 #include "common/json_util.h"
 #include "common/log.h"
 #include "fileindex/elastic/comm.h"
+#include "fileindex/elastic/document_requests.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/util.h"
 #include "sdk/platform.h"
@@ -36,62 +37,14 @@ void DescribeRequest(const Json::Value& req, std::string* command, std::string* 
   *db = StringMember(req.isObject() ? req["data"] : none, "id");
 }
 
-Json::Value MakeRequest(const char* command, Json::Value data) {
-  Json::Value req(Json::objectValue);
-  req["command"] = command;
-  req["data"] = std::move(data);
-  return req;
-}
-
-Json::Value IndexData(const std::string& share) {
-  Json::Value data(Json::objectValue);
-  data["id"] = GetFileIndexID(share);
-  return data;
-}
-
-// A prefix query on dir + "/": the directory's own document and siblings
-// that merely start with its name never match.
-Json::Value PrefixQuery(const std::string& dir) {
-  Json::Value query;
-  query["qsl"]["prefix"][kQORUMDPath] = dir + "/";
-  return query;
-}
-
 void CheckPath(const std::string& path, const char* what) {
   VELLIS_THROW_IF(path.empty() || path.back() == '/', kErrBadArgument,
                   std::string("Bad ") + what + ", path=" + path);
 }
 
-// The document of `path` from content extraction, ready to send.
-Json::Value ExtractDocument(const std::string& path, bool need_meta) {
-  Json::Value options(Json::objectValue);
-  options[kCENeedMeta] = need_meta;
-  Json::Value doc;
-  int ret = -1;
-  try {
-    ret = sdk::GetPlatform()->ParseFile(path, options, &doc);
-  } catch (...) {
-    ret = -1;  // whatever the extractor throws is one failure to the caller
-  }
-  VELLIS_THROW_IF(0 != ret || !doc.isObject(), kErrParseFailed, "Parse failed, path=" + path);
-  // The file name is searched through the n-gram field.
-  if (doc.isMember(kQORUMDFSName)) doc[kQORUMDSearchFileName] = doc[kQORUMDFSName];
-  return doc;
-}
-
 void SendDocument(const char* command, const std::string& share, const std::string& path,
                   Json::Value doc) {
-  Json::Value data = IndexData(share);
-  data["doc_id"] = path;
-  data["data"] = std::move(doc);
-  SendRequestDiscardResult(MakeRequest(command, std::move(data)));
-}
-
-// The "data" array of a query answer.
-const Json::Value& QueryResults(const Json::Value& res) {
-  VELLIS_THROW_IF(!res.isMember("data") || !res["data"].isArray(), kErrNoData,
-                  "No data array in the answer, res=" + JsonToString(res));
-  return res["data"];
+  SendRequestDiscardResult(DocumentRequest(command, share, path, std::move(doc)));
 }
 
 }  // namespace
@@ -165,24 +118,19 @@ void ShareIndexMigrate(const std::string& share, const std::string& new_path) {
 }
 
 void IndexUpsert(const std::string& share, const std::string& path, bool need_meta) {
-  SendDocument("document_upsert_by_id", share, path, ExtractDocument(path, need_meta));
+  SendRequestDiscardResult(UpsertRequest(share, path, need_meta));
 }
 
 void IndexAttr(const std::string& share, const std::string& path) {
-  SendDocument("document_set_by_id", share, path, ExtractDocument(path, false));
+  SendRequestDiscardResult(AttrRequest(share, path));
 }
 
 void IndexDel(const std::string& share, const std::string& path) {
-  Json::Value data = IndexData(share);
-  data["doc_id"] = path;
-  SendRequestDiscardResult(MakeRequest("document_del_by_id", std::move(data)));
+  SendRequestDiscardResult(DelRequest(share, path));
 }
 
 void IndexDelDir(const std::string& share, const std::string& dir) {
-  CheckPath(dir, "directory");
-  Json::Value data = IndexData(share);
-  data["query"] = PrefixQuery(dir);
-  SendRequestDiscardResult(MakeRequest("document_del_by_query", std::move(data)));
+  SendRequestDiscardResult(DelDirRequest(share, dir));
 }
 
 void IndexGetByPrefixPath(const std::string& share, const std::string& dir,

@@ -20,6 +20,7 @@
 #include "tests/support/cli_runner.h"
 #include "tests/support/fake_platform.h"
 #include "tests/support/fake_share_platform.h"
+#include "tests/support/searchd_process.h"
 #include "tests/support/temp_root.h"
 #include "tests/support/thrown.h"
 
@@ -34,26 +35,13 @@ class DaemonTest : public ::testing::Test {
  protected:
   void SetUp() override { ASSERT_NO_FATAL_FAILURE(Start()); }
   void TearDown() override { EXPECT_TRUE(pid_ <= 0 || Stop(SIGTERM) == 0) << "clean stop"; }
-  // Runs the daemon of this build in the foreground (stderr silenced) until
-  // its socket takes connections.
   void Start() {
-    if ((pid_ = fork()) == 0) {
-      if (freopen("/dev/null", "w", stderr) == nullptr) _exit(126);
-      execl(bin_.c_str(), "vellis-searchd", "-f", "--recv-timeout-ms=300", nullptr);
-      _exit(127);
-    }
-    for (int i = 0; !sdk::DomainSockConnection(socket_).Connect(); ++i, usleep(10000)) {
-      if (pid_ > 0 && waitpid(pid_, nullptr, WNOHANG) == pid_) pid_ = -1;
-      ASSERT_TRUE(pid_ > 0 && i < 500) << "the daemon did not come up";
-    }
+    ASSERT_TRUE(daemon_.Start()) << "the daemon did not come up";
+    pid_ = daemon_.pid();
   }
-  // Sends `sig` and returns the exit status, or minus the signal. Never
-  // signals without a daemon: kill(-1) would reach every process.
   int Stop(int sig) {
-    int status = 0;
-    if (pid_ <= 0 || kill(pid_, sig) != 0 || waitpid(pid_, &status, 0) != pid_) return -1000;
     pid_ = -1;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+    return daemon_.Stop(sig);
   }
 
   Json::Value Ok(const Json::Value& r) { return DataOf(r, sdk::Exchange(socket_, r)); }
@@ -63,9 +51,9 @@ class DaemonTest : public ::testing::Test {
   }
 
   TempRoot root_;
-  const char* dir_ = getenv("VELLIS_TEST_BINARY_DIR");
-  std::string bin_ = std::string(dir_ ? dir_ : ".") + "/bin/vellis-searchd";
-  std::string socket_ = RootPath(kElasticSocketPath);
+  SearchdProcess daemon_;
+  const std::string bin_ = daemon_.bin();
+  const std::string socket_ = daemon_.socket();
   std::string pid_file_ = RootPath(daemon::PidFilePath("vellis-searchd"));
   FakePlatform platform_;
   ScopedPlatform scoped_{&platform_};
