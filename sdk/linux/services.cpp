@@ -154,7 +154,9 @@ int Spawn(const std::string& path) {
         if (fd != pipe_fds[1]) close(fd);
       }
     }
-    char* argv[] = {const_cast<char*>(path.c_str()), nullptr};
+    // Already detached here: our daemons must not fork again, or the pid
+    // recorded would be the wrong one.
+    char* argv[] = {const_cast<char*>(path.c_str()), const_cast<char*>("--foreground"), nullptr};
     execv(path.c_str(), argv);
     int report[2] = {-1, errno};
     if (write(pipe_fds[1], report, sizeof(report)) < 0) _exit(127);
