@@ -82,11 +82,13 @@ int64_t ShareWorker::Step() {
   }
   if (now < retry_at_ms_) return retry_at_ms_;
   RunRound();
-  if (stop_) return -1;
+  const int64_t after = clock_();
+  if (stop_ || share_paused_) return -1;  // a wake-up brings the next step
+  if (retry_at_ms_ > after) return retry_at_ms_;
+  // Lines that came during the round settle like a new burst.
   has_work_ = QueueHasWork();
-  work_seen_ms_ = clock_();
-  if (retry_at_ms_ > clock_()) return retry_at_ms_;
-  return has_work_ ? work_seen_ms_ + options_.settle_ms : -1;
+  work_seen_ms_ = after;
+  return has_work_ ? after + options_.settle_ms : -1;
 }
 
 void ShareWorker::BetweenBatches(fileindex::Indexer& indexer) {
