@@ -27,6 +27,7 @@ namespace {
 
 constexpr ServiceMapping kServices[] = {
     {"samba", "smbd.service", nullptr},
+    {kSearchService, "vellis-searchd.service", "vellis-searchd"},
     {"qorucontentextractd", "vellis-extractd.service", "vellis-extractd"},
     {"pkg-Vellis-fileindexd", "vellis-fileindexd.service", "vellis-fileindexd"},
 };
@@ -63,12 +64,6 @@ std::string ExecutableDir() {
   ssize_t n = readlink("/proc/self/exe", buf, sizeof(buf) - 1);
   if (n <= 0) return "";
   return Dirname(std::string(buf, static_cast<size_t>(n)));
-}
-
-std::string ProgramPath(const std::string& program) {
-  const char* env = getenv(kDaemonDirEnv);
-  std::string dir = env && *env ? env : ExecutableDir();
-  return dir.empty() ? "" : dir + "/" + program;
 }
 
 // Field 22 of /proc/<pid>/stat (the start time in clock ticks since boot),
@@ -187,7 +182,7 @@ int Spawn(const std::string& path) {
 }
 
 int StartOwn(const std::string& program) {
-  const std::string path = ProgramPath(program);
+  const std::string path = ServiceProgramPath(program);
   if (path.empty()) return FailAt(ENOENT, __FILE__, __LINE__);
   if (access(path.c_str(), X_OK) != 0) return FailAt(errno, __FILE__, __LINE__);
   try {
@@ -284,6 +279,12 @@ const ServiceMapping* FindService(const std::string& service) {
     if (service == s.service) return &s;
   }
   return nullptr;
+}
+
+std::string ServiceProgramPath(const std::string& program) {
+  const char* env = getenv(kDaemonDirEnv);
+  std::string dir = env && *env ? env : ExecutableDir();
+  return dir.empty() ? "" : dir + "/" + program;
 }
 
 std::string ServicePidFile(const std::string& program) {

@@ -26,6 +26,10 @@ inline constexpr char kServiceLockPrefix[] = "/tmp/vellis_service_";
 inline constexpr char kSambaInitScript[] = "/etc/init.d/smbd";
 inline constexpr char kSystemctlProgram[] = "/bin/systemctl";
 
+// The search daemon as a service of its own: the appliance starts it with
+// the system, the command line (`vellis services start`) without one.
+inline constexpr char kSearchService[] = "vellis-searchd";
+
 // What an appliance service name stands for here.
 struct ServiceMapping {
   const char* service;  // the appliance's name ("pkg-Vellis-fileindexd")
@@ -35,6 +39,10 @@ struct ServiceMapping {
 
 // The mapping of `service`; null for a name we do not know.
 const ServiceMapping* FindService(const std::string& service);
+
+// Where our program `program` is run from: $VELLIS_DAEMON_DIR, else the
+// folder of the running executable; "" when neither is known.
+std::string ServiceProgramPath(const std::string& program);
 
 // The pid file of our program `program` under the root.
 std::string ServicePidFile(const std::string& program);

@@ -33,5 +33,7 @@ void AddShareOpsCommands(CLI::App& app, Context& ctx);
 void AddVolumeCommands(CLI::App& app, Context& ctx);
 void AddUserCommands(CLI::App& app, Context& ctx);
 void AddServicesCommands(CLI::App& app, Context& ctx);
+// `vellis status`: the daemons, the pause and each indexed folder's progress.
+void AddStatusCommands(CLI::App& app, Context& ctx);
 
 }  // namespace vellis::cli

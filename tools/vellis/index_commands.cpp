@@ -78,8 +78,9 @@ void AddIndexCommands(CLI::App& app, Context& ctx) {
   CLI::App* index = app.add_subcommand("index", "Fill the search daemon's index of a share");
   index->require_subcommand(1);
   CLI::App* load = index->add_subcommand(
-      "load", "Create the share's index if needed and upsert every indexable file and folder "
-              "of the share (content included), then commit");
+      "load",
+      "Create the share's index if needed and upsert every indexable file and folder "
+      "of the share (content included), then commit");
   load->add_option("SHARE", args->share, "Share name")->required();
   load->add_option("--limit", args->limit, "Stop after this many documents (0: no limit)");
   load->callback([&ctx, args] { ctx.action = [args] { Load(*args); }; });

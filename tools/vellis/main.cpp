@@ -24,6 +24,7 @@ int main(int argc, char** argv) {
   vellis::cli::AddVolumeCommands(app, ctx);
   vellis::cli::AddUserCommands(app, ctx);
   vellis::cli::AddServicesCommands(app, ctx);
+  vellis::cli::AddStatusCommands(app, ctx);
 
   try {
     app.parse(argc, argv);

@@ -62,19 +62,4 @@ void AddUserCommands(CLI::App& app, Context& ctx) {
   }
 }
 
-void AddServicesCommands(CLI::App& app, Context& ctx) {
-  CLI::App* services = app.add_subcommand("services", "The services that indexing needs");
-  services->require_subcommand(1);
-  CLI::App* prepare = services->add_subcommand(
-      "prepare",
-      "Start the content-extraction service and the indexing daemon (and switch on the "
-      "file-sharing search support) when folders are indexed; stop them when none is");
-  prepare->callback([&ctx] {
-    ctx.action = [] {
-      fileindex::PrepareServices();
-      std::cout << "services prepared\n";
-    };
-  });
-}
-
 }  // namespace vellis::cli
