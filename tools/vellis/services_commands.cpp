@@ -65,15 +65,16 @@ bool StopAll() {
       ok = false;
     }
   }
-  for (const DaemonState& d : ProbeDaemons()) {
-    if (d.pid > 0 || d.answers) {
+  daemons = ProbeDaemons();
+  for (auto d = daemons.rbegin(); d != daemons.rend(); ++d) {
+    if (d->pid > 0 || d->answers) {
       // Started by hand or by another root: the services layer has no
       // record of it and leaves it alone.
-      std::cout << d.program << ": still running (pid " << PidText(d.pid)
+      std::cout << d->program << ": still running (pid " << PidText(d->pid)
                 << "), not started as a service\n";
       ok = false;
-    } else if (d.installed) {
-      std::cout << d.program << ": stopped\n";
+    } else if (d->installed) {
+      std::cout << d->program << ": stopped\n";
     }
   }
   return ok;
