@@ -1,104 +1,88 @@
 #!/usr/bin/env bash
-# The main job: sets up and builds, then, under a temporary root:
-#  1. registers a share, asks which of its paths may be indexed, generates a
-#     sample queue of file-change events in the share's queue, folds it with
-#     `vellis queue fold`, rotates the queue and asks what is pending;
-#  2. starts the search daemon, registers a share holding a sample of real
-#     documents (from /usr/share/doc), fills its index through the library's
-#     own requests (`vellis index load`) and runs a few searches.
+# The main job: sets up and builds, then, under a temporary root, runs the
+# service as a user would:
+#  1. starts the daemons (`vellis services start`);
+#  2. registers a share holding a sample of real documents (from
+#     /usr/share/doc) and generated files of several types, adds it as an
+#     indexed folder, and follows the indexing until it is finished;
+#  3. runs a few searches;
+#  4. edits a file, renames a folder and deletes a file, reports each change
+#     as the file-change monitor does, and shows that the searches follow;
+#  5. stops the daemons.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 scripts/setup.sh build
-VELLIS=build/bin/vellis
-
-SEARCHD=build/bin/vellis-searchd
+VELLIS="$PWD/build/bin/vellis"
 
 export VELLIS_ROOT="$(mktemp -d /tmp/vellis-demo-XXXXXX)"
 cleanup() {
-  if [ -f "$VELLIS_ROOT/var/run/vellis-searchd.pid" ]; then
-    kill "$(cat "$VELLIS_ROOT/var/run/vellis-searchd.pid")" 2>/dev/null || true
-    sleep 0.5
-  fi
+  "$VELLIS" services stop > /dev/null 2>&1 || true
   rm -rf "$VELLIS_ROOT"
 }
 trap cleanup EXIT
-share="$VELLIS_ROOT/volume1/photo"
-# A share's index data lives on its own volume: <volume>/@fileindex/<share>/.
-queue="$VELLIS_ROOT/volume1/@fileindex/photo/queue"
-mkdir -p "$share/2019" "$share/albums" "$share/#recycle" "$(dirname "$queue")"
-echo hello > "$share/2019/a.jpg"
-echo deleted > "$share/#recycle/x.jpg"
-ln -s /etc "$share/etc-link"
+step() { printf '\n== %s\n' "$*"; }
 
-echo "== vellis share add / list"
-"$VELLIS" share add photo "$share" --recycle-bin
-"$VELLIS" share list
-echo "== vellis path check: which paths may be indexed"
-for p in "$share/2019" "$share/2019/" "$share/etc-link" "$share/#recycle/x.jpg"; do
-  printf '%s: ' "${p#$VELLIS_ROOT}"
-  "$VELLIS" path check "$p" || true
-done
-echo "-- as JSON, with the exit status scripts branch on (1: not indexable)"
-"$VELLIS" path check "$share/#recycle/x.jpg" --json || echo "exit status $?"
-echo "== vellis path type / share"
-"$VELLIS" path type "$share/2019/a.jpg"
-"$VELLIS" path share "$share/2019/a.jpg"
+step "vellis services start"
+"$VELLIS" services start
 
-cat > "$queue" <<QUEUE
-{"event":64,"path":"$share/2019/a.jpg"}
-{"event":2,"path":"$share/2019/a.jpg"}
-{"event":64,"path":"$share/2019/b.jpg"}
-{"event":128,"path":"$share/2019/b.jpg"}
-{"event":128,"path":"$share/2019/c.jpg"}
-{"event":64,"path":"$share/2019/c.jpg"}
-{"event":4,"path":"$share/notes.txt"}
-{"event":2,"path":"$share/notes.txt"}
-{"event":256,"path":"$share/2020","path_old":"$share/2019"}
-{"event":64,"is_dir":true,"path":"$share/albums"}
-{"event":131072,"path":"$share","data":{"document":true}}
-{"event":131072,"path":"$share","data":{"photo":true}}
-this line is not JSON
-{"event":2,"path":"relative/path.txt"}
-QUEUE
-
-echo "== queue: $(wc -l < "$queue") lines"
-echo "== vellis -v queue fold (skipped lines are logged; each surviving operation, then the count)"
-"$VELLIS" -v queue fold "$queue"
-echo "== vellis queue pending (before rotation)"
-"$VELLIS" queue pending "$queue" "$share/2020"
-echo "== vellis queue rotate"
-"$VELLIS" queue rotate "$queue"
-ls "$(dirname "$queue")"
-echo "== vellis queue pending (the side file still counts)"
-"$VELLIS" queue pending "$queue" "$share/2020"
-
-echo
-echo "== search: start vellis-searchd (detached, pid file and socket under the root)"
-"$SEARCHD"
-for _ in $(seq 50); do [ -S "$VELLIS_ROOT/var/run/qoruelasticd.sock" ] && break; sleep 0.1; done
-docs="$VELLIS_ROOT/volume1/doc"
+docs="$VELLIS_ROOT/volume1/docs"
 mkdir -p "$docs"
-# A sample of real documents: text, Markdown and HTML files of the installed
+# Real documents: the text, Markdown and HTML files of the installed
 # packages' documentation.
 (cd /usr/share/doc && find . -type f \( -name '*.txt' -o -name '*.md' -o -name '*.html' \) \
   | sort | head -400 | while read -r f; do
-    mkdir -p "$docs/$(dirname "$f")" && cp "$f" "$docs/$f"
-  done)
-if [ "$(find "$docs" -type f | wc -l)" -lt 10 ]; then
-  # A machine without package documentation: a few documents of our own.
-  mkdir -p "$docs/git" "$docs/notes"
-  echo "This program is free software under the GNU General Public License." > "$docs/git/README.md"
-  echo "To install, run make install; read the license first." > "$docs/git/INSTALL.txt"
-  echo "Reading list: the license, the readme and the install notes." > "$docs/notes/readme.txt"
-fi
-"$VELLIS" share add doc "$docs"
-echo "== vellis index load doc"
-"$VELLIS" index load doc
-echo '== vellis search license --limit 3'
+    mkdir -p "$docs/manuals/$(dirname "$f")" && cp "$f" "$docs/manuals/$f"
+  done) || true
+# Generated files of other kinds: notes, tables, data, pages, and pictures
+# (found by name and type, their bytes are not text).
+mkdir -p "$docs/projects/orchard" "$docs/projects/harbour" "$docs/photos/2025"
+for i in $(seq 1 40); do
+  printf 'Meeting notes %d\nThe orchard project plants %d apple trees this season.\n' \
+    "$i" "$((i * 7))" > "$docs/projects/orchard/notes-$i.txt"
+  printf 'week,crates,quince\n%d,%d,%d\n' "$i" "$((i * 3))" "$((i % 5))" \
+    > "$docs/projects/harbour/tally-$i.csv"
+done
+printf '{"project": "harbour", "berths": 12, "keeper": "lighthouse"}\n' \
+  > "$docs/projects/harbour/config.json"
+printf '<html><body><h1>Harbour</h1><p>The lighthouse keeper logs every ship.</p></body></html>\n' \
+  > "$docs/projects/harbour/index.html"
+for i in $(seq 1 10); do head -c 2048 /dev/urandom > "$docs/photos/2025/IMG_$i.jpg"; done
+echo "sample: $(find "$docs" -type f | wc -l) files in $(find "$docs" -type d | wc -l) folders"
+
+step "vellis share add docs <folder>; vellis folder add /docs"
+"$VELLIS" share add docs "$docs"
+"$VELLIS" folder add /docs
+step "vellis status --watch (until every folder is finished)"
+"$VELLIS" status --watch --timeout 300
+step "vellis status"
+"$VELLIS" status
+
+step 'vellis search license --limit 3'
 "$VELLIS" search license --limit 3
-echo '== vellis search "general public license" --limit 2'
-"$VELLIS" search '"general public license"' --limit 2
-echo '== vellis search read* --name READ --limit 3  (file names containing "read")'
-"$VELLIS" search 'read*' --name READ --limit 3
-echo '== vellis search install --category document --path <share>/git --limit 2'
-"$VELLIS" search install --category document --path "$docs/git" --limit 2
+step 'vellis search "apple trees" --limit 2'
+"$VELLIS" search '"apple trees"' --limit 2
+step 'vellis search lighthouse'
+"$VELLIS" search lighthouse
+step 'vellis search "" --name img_1 --category image  (pictures, found by name)'
+"$VELLIS" search '' --name img_1 --category image --limit 3
+
+step "changes: edit a note, rename a folder, delete a page"
+echo "The orchard now grows medlar trees as well." >> "$docs/projects/orchard/notes-1.txt"
+mv "$docs/projects/harbour" "$docs/projects/port"
+rm "$docs/projects/port/index.html"
+# The file-change monitor reports each change to the share's queue; here
+# the command line reports them the same way.
+"$VELLIS" queue add modify "$docs/projects/orchard/notes-1.txt"
+"$VELLIS" queue add rename "$docs/projects/port" --old "$docs/projects/harbour"
+"$VELLIS" queue add delete "$docs/projects/port/index.html"
+"$VELLIS" status --watch --timeout 60
+step 'vellis search medlar  (the edit)'
+"$VELLIS" search medlar
+step 'vellis search quince --limit 2  (the renamed folder: every tally is under port/)'
+"$VELLIS" search quince --limit 2
+step 'vellis search lighthouse  (the page is gone; the data file stays)'
+"$VELLIS" search lighthouse
+
+step "vellis services status; vellis services stop"
+"$VELLIS" services status
+"$VELLIS" services stop
