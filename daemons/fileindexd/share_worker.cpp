@@ -25,10 +25,14 @@ void Log(int priority, const std::string& text) {
   sdk::GetPlatform()->Syslog(priority, "fileindexd: " + text);
 }
 
-bool NonEmptyFile(const std::string& path) {
+// Bytes of the regular file at `path`; 0 when there is none.
+int64_t FileBytes(const std::string& path) {
   struct stat st;
-  return lstat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode) && st.st_size > 0;
+  return lstat(path.c_str(), &st) == 0 && S_ISREG(st.st_mode) ? st.st_size : 0;
 }
+
+// A queue that keeps growing is taken after this many settle times at most.
+constexpr int64_t kMaxSettles = 10;
 
 }  // namespace
 
@@ -52,8 +56,8 @@ void ShareWorker::SetState(const std::string& state) {
   status_.state = state;
 }
 
-bool ShareWorker::QueueHasWork() const {
-  return NonEmptyFile(queue_path_) || NonEmptyFile(queue_path_ + ".tmp");
+int64_t ShareWorker::QueueBytes() const {
+  return FileBytes(queue_path_) + FileBytes(queue_path_ + ".tmp");
 }
 
 int64_t ShareWorker::HeldUntil(bool* share_paused) const {
@@ -66,15 +70,24 @@ int64_t ShareWorker::HeldUntil(bool* share_paused) const {
 
 int64_t ShareWorker::Step() {
   const int64_t now = clock_();
-  if (!has_work_ && QueueHasWork()) {
+  const int64_t bytes = QueueBytes();
+  if (!has_work_ && bytes > 0) {
     has_work_ = true;
     work_seen_ms_ = now;
+    quiet_since_ms_ = now;
+  } else if (bytes != queue_bytes_) {
+    quiet_since_ms_ = now;  // still growing: the burst goes on
   }
+  queue_bytes_ = bytes;
   if (!has_work_) {
     SetState("idle");
     return -1;
   }
-  if (now < work_seen_ms_ + options_.settle_ms) return work_seen_ms_ + options_.settle_ms;
+  // The settle time counts from the last growth, but a queue that never
+  // stops growing is taken all the same.
+  const int64_t due = std::min(quiet_since_ms_ + options_.settle_ms,
+                               work_seen_ms_ + kMaxSettles * options_.settle_ms);
+  if (now < due) return due;
   bool share_paused = false;
   if (const int64_t held = HeldUntil(&share_paused); held != 0) {
     SetState("paused");
@@ -86,8 +99,9 @@ int64_t ShareWorker::Step() {
   if (stop_ || share_paused_) return -1;  // a wake-up brings the next step
   if (retry_at_ms_ > after) return retry_at_ms_;
   // Lines that came during the round settle like a new burst.
-  has_work_ = QueueHasWork();
-  work_seen_ms_ = after;
+  queue_bytes_ = QueueBytes();
+  has_work_ = queue_bytes_ > 0;
+  work_seen_ms_ = quiet_since_ms_ = after;
   return has_work_ ? after + options_.settle_ms : -1;
 }
 

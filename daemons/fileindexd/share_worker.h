@@ -1,6 +1,7 @@
 // One share's worker in the indexing daemon: it sleeps until the share's
 // queue grows (inotify on the queue's folder, no polling), lets a burst
-// settle, then runs a round (QueueMgr::ProcessOP with an Indexer) and
+// settle (the queue quiet for the settle time, or at most ten settle times
+// after it started), then runs a round (QueueMgr::ProcessOP with an Indexer) and
 // deletes the side file after the round's last commit. A failed round
 // leaves the side file and is retried with a growing delay. A pause (the
 // daemon's, or every folder of the share paused) holds the worker between
@@ -82,7 +83,8 @@ class ShareWorker {
 
  private:
   struct Interrupted {};
-  bool QueueHasWork() const;
+  // Bytes in the live queue and its side file.
+  int64_t QueueBytes() const;
   // 0 when nothing holds the worker, else until when (-1: until a wake).
   int64_t HeldUntil(bool* share_paused) const;
   void RunRound();
@@ -97,7 +99,9 @@ class ShareWorker {
   Clock clock_;
 
   bool has_work_ = false;
-  int64_t work_seen_ms_ = 0;
+  int64_t work_seen_ms_ = 0;    // when the waiting work was first seen
+  int64_t quiet_since_ms_ = 0;  // when the queue last grew
+  int64_t queue_bytes_ = 0;
   int64_t retry_at_ms_ = 0;
   int retry_delay_ms_ = 0;
   std::atomic<bool> share_paused_{false};  // every folder of the share paused

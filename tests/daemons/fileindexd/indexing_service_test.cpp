@@ -124,9 +124,19 @@ TEST_F(IndexingServiceTest, WorkerStepsSettleHoldAndRetry) {
   testing::WriteFile(share_ + "/docs/a.txt", "alpha");
   EXPECT_EQ(worker.Step(), -1) << "nothing queued";
   Queue(R"({"event": 64, "path": ")" + share_ + R"(/docs/a.txt"})");
+  const int64_t first = now_;
   EXPECT_EQ(worker.Step(), now_ + 1000) << "a burst settles first";
+  now_ += 600;
+  Queue(R"({"event": 2, "path": ")" + share_ + R"(/docs/a.txt"})");
+  EXPECT_EQ(worker.Step(), now_ + 1000) << "the settle time counts from the last line";
+  for (int i = 0; i < 20; ++i) {  // a queue that never stops growing
+    now_ += 600;
+    Queue(R"({"event": 2, "path": ")" + share_ + R"(/docs/a.txt"})");
+    if (worker.Step() == first + 10 * 1000) break;
+  }
+  EXPECT_EQ(worker.Step(), first + 10 * 1000) << "is taken ten settle times after it began";
   Command(R"({"type": "pause", "data": {"resume_time": 0}})");
-  now_ += 1000;
+  now_ = first + 10 * 1000;
   EXPECT_EQ(worker.Step(), -1) << "held until resumed";
   EXPECT_EQ(worker.status().state, "paused");
   Command(R"({"type": "resume"})");
