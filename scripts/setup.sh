@@ -8,7 +8,8 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 
 PACKAGES=(build-essential cmake pkg-config libjsoncpp-dev libcli11-dev libgtest-dev
-          libgmock-dev libbenchmark-dev libsqlite3-dev libunistring-dev util-linux)
+          libgmock-dev libbenchmark-dev libsqlite3-dev libunistring-dev util-linux
+          dpkg-dev file)  # the last two: cpack -G DEB (dpkg-shlibdeps)
 if [[ " $* " == *"cmake/i386.cmake"* ]]; then
   # The search daemon links the i386 SQLite runtime (cmake/i386.cmake says why).
   PACKAGES+=(g++-multilib libjsoncpp-dev:i386 libunistring-dev:i386 libgtest-dev:i386
