@@ -3,15 +3,22 @@
 #include <fcntl.h>
 #include <sys/file.h>
 #include <sys/resource.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdlib>
 #include <cstring>
 
 #include "common/error.h"
 #include "common/fs_util.h"
 
 namespace vellis::daemon {
+
+int LogOptions(bool foreground) {
+  const char* journal = getenv("JOURNAL_STREAM");
+  return LOG_PID | (foreground && !(journal && *journal) ? LOG_PERROR : 0);
+}
 
 std::string PidFilePath(const std::string& name) { return "/var/run/" + name + ".pid"; }
 

@@ -6,6 +6,11 @@
 
 namespace vellis::daemon {
 
+// openlog() options of a daemon: the pid, and a copy of each line on
+// stderr in the foreground, except when stderr already goes to the journal
+// ($JOURNAL_STREAM, set by systemd), where the copy would double each line.
+int LogOptions(bool foreground);
+
 // The pid file of the program `name`: "/var/run/<name>.pid"; resolve with
 // RootPath() at use.
 std::string PidFilePath(const std::string& name);

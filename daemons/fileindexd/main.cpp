@@ -86,7 +86,7 @@ int main(int argc, char** argv) {
       ->check(CLI::Range(1, 3600));
   CLI11_PARSE(app, argc, argv);
 
-  openlog("vellis-fileindexd", LOG_PID | (foreground ? LOG_PERROR : 0), LOG_DAEMON);
+  openlog("vellis-fileindexd", vellis::daemon::LogOptions(foreground), LOG_DAEMON);
   try {
     if (!foreground) vellis::daemon::Daemonize();
     return Serve(options);

@@ -82,7 +82,7 @@ int main(int argc, char** argv) {
       ->check(CLI::Range(1, 3600 * 1000));
   CLI11_PARSE(app, argc, argv);
 
-  openlog("vellis-searchd", LOG_PID | (foreground ? LOG_PERROR : 0), LOG_DAEMON);
+  openlog("vellis-searchd", vellis::daemon::LogOptions(foreground), LOG_DAEMON);
   try {
     if (!foreground) vellis::daemon::Daemonize();
     return Serve(workers, recv_timeout_ms);
