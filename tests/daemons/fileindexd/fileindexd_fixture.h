@@ -101,6 +101,8 @@ class FileindexdTest : public ::testing::Test {
     fileindex::FolderAdd(list, false);
   }
 
+  std::string QueuePath() const { return sdk::SDKShare("s").GetQueuePath(); }
+
   // --- The daemon's command channel ---
   Json::Value Command(const std::string& type, const Json::Value& data = Json::Value()) {
     Json::Value answer;
@@ -158,30 +160,33 @@ class FileindexdTest : public ::testing::Test {
     }
     return docs;
   }
-  // The search for `word` below the share: its answer's data.
-  Json::Value Search(const std::string& word, int limit) {
+  // The search for `word` below the share's folder `rel`: its answer's data.
+  Json::Value Search(const std::string& word, int limit, const std::string& rel = "") {
     Json::Value req(Json::objectValue);
     req["command"] = "document_search";
     req["data"]["id"] = fileindex::elastic::GetFileIndexID("s");
     req["data"]["query"] = word;
-    req["data"]["path"] = share_ + "/";
+    req["data"]["path"] = share_ + rel + "/";
     req["data"]["limit"] = limit;
     const Json::Value answer = sdk::Exchange(RootPath(kElasticSocketPath), req);
     EXPECT_TRUE(answer["success"].asBool()) << JsonToString(answer);
     return answer["data"];
   }
-  // The documents whose content or name holds `word` (at most 1,000).
-  std::vector<std::string> Found(const std::string& word) {
+  // The documents below `rel` whose content or name holds `word` (at most
+  // 1,000).
+  std::vector<std::string> Found(const std::string& word, const std::string& rel = "") {
     std::vector<std::string> paths;
-    const Json::Value data = Search(word, 1000);
+    const Json::Value data = Search(word, 1000, rel);
     for (const Json::Value& hit : data["hits"]) {
       paths.push_back(Rel(hit["id"].asString()));
     }
     std::sort(paths.begin(), paths.end());
     return paths;
   }
-  // How many they are.
-  int64_t Hits(const std::string& word) { return Search(word, 0)["total"].asInt64(); }
+  // How many hold it below `rel`.
+  int64_t Hits(const std::string& word, const std::string& rel = "") {
+    return Search(word, 0, rel)["total"].asInt64();
+  }
   // What the index should hold for the folder `rel` with every category:
   // the folder, and every directory and regular file below it.
   Docs Disk(const std::string& rel) {
