@@ -207,7 +207,7 @@ TEST_F(FileindexdBadInputTest, ShareFolderRemovedDuringACrawl) {
 
   Report(kEventDelete, "/docs");
   ASSERT_TRUE(WaitSettled());
-  EXPECT_EQ(Index(), Docs{});
+  EXPECT_EQ(Diff({}, Index()), "");
 
   Write("/docs/back.txt", "back");
   Report(kEventReindex, "/docs");

@@ -21,6 +21,7 @@
 #include <thread>
 #include <vector>
 
+#include "common/error.h"
 #include "common/json_util.h"
 #include "common/root_path.h"
 #include "fileindex/elastic/comm.h"
@@ -104,10 +105,17 @@ class FileindexdTest : public ::testing::Test {
   std::string QueuePath() const { return sdk::SDKShare("s").GetQueuePath(); }
 
   // --- The daemon's command channel ---
+  // The answer to a command sent as the library sends it; null, and a
+  // failure, when none comes.
   Json::Value Command(const std::string& type, const Json::Value& data = Json::Value()) {
     Json::Value answer;
-    const std::string text = fileindex::SendCommandToDaemon(type, data);
-    EXPECT_TRUE(JsonFromString(answer, text)) << text;
+    try {
+      const std::string text = fileindex::SendCommandToDaemon(type, data);
+      EXPECT_TRUE(JsonFromString(answer, text)) << text;
+    } catch (const Error& e) {
+      ADD_FAILURE() << "no answer to " << type << ": " << e.what() << "\nlog:\n"
+                    << daemon_.LogTail();
+    }
     return answer;
   }
   // The status of the share's worker (null without a worker).
@@ -118,7 +126,13 @@ class FileindexdTest : public ::testing::Test {
   ::testing::AssertionResult WaitFor(const std::function<bool()>& done, const std::string& what,
                                      int timeout_ms = 20000) {
     const auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeout_ms);
-    while (!done()) {
+    for (;;) {
+      if (!daemon_.Running()) {
+        return ::testing::AssertionFailure() << "the daemon exited with " << daemon_.exit_status()
+                                             << " while waiting: " << what << "\nlog:\n"
+                                             << daemon_.LogTail();
+      }
+      if (done()) break;
       if (std::chrono::steady_clock::now() > end) {
         return ::testing::AssertionFailure()
                << "not within " << timeout_ms << " ms: " << what
