@@ -32,11 +32,12 @@ class FileindexdEndToEndTest : public FileindexdTest {};
 TEST_F(FileindexdEndToEndTest, MonitorLinesBecomeDocuments) {
   AddFolder("/docs");
   ASSERT_TRUE(WaitSettled());
+  using Searches = std::vector<std::pair<std::string, Paths>>;  // word, documents holding it
   const struct {
     const char* what;
     std::function<void()> act;
-    const char* word;  // searched for afterwards
-    Paths found;       // the documents that hold it
+    Searches searches;
+    std::function<void()> check;  // more, when set
   } steps[] = {
       {"created",
        [&] {
@@ -49,31 +50,27 @@ TEST_F(FileindexdEndToEndTest, MonitorLinesBecomeDocuments) {
            Report(kEventCreate, rel);
          }
        },
-       "alpha",
-       {"/docs/a.txt"}},
-      {"edited, same size and second",  // only the content tells
+       {{"alpha", {"/docs/a.txt"}}, {"gamma", {"/docs/sub/c.txt"}}}},
+      {"edited, same size",  // only the content tells
        [&] {
          Write("/docs/a.txt", "delta");
          Report(kEventModify, "/docs/a.txt");
        },
-       "alpha",
-       {}},
-      {"edited content is searchable", [] {}, "delta", {"/docs/a.txt"}},
+       {{"alpha", {}}, {"delta", {"/docs/a.txt"}}}},
       {"edited, longer",
        [&] {
          Write("/docs/b.txt", "epsilon epsilon");
          Report(kEventModify, "/docs/b.txt");
        },
-       "epsilon",
-       {"/docs/b.txt"}},
+       {{"beta", {}}, {"epsilon", {"/docs/b.txt"}}}},
       {"attributes changed",
        [&] {
          ASSERT_EQ(chmod((share_ + "/docs/sub/c.txt").c_str(), 0600), 0);
          Report(kEventAttr, "/docs/sub/c.txt");
        },
-       "gamma",
-       {"/docs/sub/c.txt"}},
-      {"created and deleted within one round",
+       {{"gamma", {"/docs/sub/c.txt"}}},
+       [&] { EXPECT_EQ(Search("gamma", 1)["hits"][0]["fields"]["QORUMDPrivilege"], "0600"); }},
+      {"created and deleted at once",
        [&] {
          Write("/docs/tmp.txt", "zeta");
          Report(kEventCreate, "/docs/tmp.txt");
@@ -81,15 +78,13 @@ TEST_F(FileindexdEndToEndTest, MonitorLinesBecomeDocuments) {
          ASSERT_EQ(unlink((share_ + "/docs/tmp.txt").c_str()), 0);
          Report(kEventDelete, "/docs/tmp.txt");
        },
-       "zeta",
-       {}},
+       {{"zeta", {}}}},
       {"file deleted",
        [&] {
          ASSERT_EQ(unlink((share_ + "/docs/b.txt").c_str()), 0);
          Report(kEventDelete, "/docs/b.txt");
        },
-       "epsilon",
-       {}},
+       {{"epsilon", {}}}},
       {"folder deleted with its file",
        [&] {
          ASSERT_EQ(unlink((share_ + "/docs/sub/c.txt").c_str()), 0);
@@ -97,15 +92,15 @@ TEST_F(FileindexdEndToEndTest, MonitorLinesBecomeDocuments) {
          Report(kEventDelete, "/docs/sub/c.txt");
          Report(kEventDelete, "/docs/sub");
        },
-       "gamma",
-       {}},
+       {{"gamma", {}}}},
   };
   for (const auto& step : steps) {
     SCOPED_TRACE(step.what);
     ASSERT_NO_FATAL_FAILURE(step.act());
     ASSERT_TRUE(WaitSettled());
     EXPECT_EQ(Diff(Disk("/docs"), Index()), "");
-    EXPECT_EQ(Found(step.word), step.found);
+    for (const auto& [word, paths] : step.searches) EXPECT_EQ(Found(word), paths) << word;
+    if (step.check) step.check();
   }
 }
 
@@ -180,12 +175,16 @@ TEST_F(FileindexdEndToEndTest, FolderCommandsReachTheIndex) {
   EXPECT_EQ(Diff(Disk("/docs"), Index()), "") << "the other folder stays as it was";
 
   // The share's last folder: its worker and its index go.
+  auto indexes = [] {
+    Json::Value list;
+    fileindex::elastic::SendRequestRetryOnBusy(
+        list, fileindex::elastic::MakeRequest("index_list", Json::Value(Json::objectValue)));
+    return JsonToString(list["data"]);
+  };
+  ASSERT_NE(indexes().find("\"fileindex_s\""), std::string::npos) << indexes();
   ExpectRuns({{"folder delete /s/docs", 0, "deleted /s/docs\n"}});
   EXPECT_TRUE(WaitFor([&] { return ShareStatus().isNull(); }, "the worker goes"));
-  Json::Value list;
-  fileindex::elastic::SendRequestRetryOnBusy(
-      list, fileindex::elastic::MakeRequest("index_list", Json::Value(Json::objectValue)));
-  EXPECT_EQ(JsonToString(list["data"]).find("fileindex_s"), std::string::npos) << list;
+  EXPECT_EQ(indexes().find("\"fileindex_s\""), std::string::npos) << indexes();
 }
 
 // Paused until resumed, or until a time: queue lines wait, the worker says
