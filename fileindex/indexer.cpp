@@ -1,6 +1,9 @@
 #include "fileindex/indexer.h"
 
 #include <sys/stat.h>
+#include <unistr.h>
+
+#include <cstdio>
 
 #include "common/error.h"
 #include "common/fs_util.h"
@@ -47,6 +50,30 @@ bool HasPreservedComponent(const std::string& path, const std::string& top) {
     start = end + 1;
   }
   return false;
+}
+
+// The search daemon takes UTF-8 JSON only: a request that holds another
+// name is refused whole, with every other request of its batch.
+bool IsUtf8(const std::string& path) {
+  return u8_check(reinterpret_cast<const uint8_t*>(path.data()), path.size()) == nullptr;
+}
+
+// `path` for messages, each byte that is not UTF-8 written "\xNN".
+std::string Printable(const std::string& path) {
+  std::string out;
+  const uint8_t* at = reinterpret_cast<const uint8_t*>(path.data());
+  const uint8_t* end = at + path.size();
+  while (at < end) {
+    const uint8_t* bad = u8_check(at, end - at);
+    if (bad == nullptr) bad = end;
+    out.append(reinterpret_cast<const char*>(at), bad - at);
+    if (bad == end) break;
+    char hex[8];
+    snprintf(hex, sizeof(hex), "\\x%02X", *bad);
+    out += hex;
+    at = bad + 1;
+  }
+  return out;
 }
 
 bool SameCategories(const Folder& a, const Folder& b) {
@@ -257,7 +284,7 @@ void Indexer::Crawl(const std::string& root) {
     const bool indexed = folders_.IsFullPathIndexed(dir);
     if (!indexed && !on_the_way) return choice;
     if (CheckFullPathIndexable(dir) != IndexRule::kIndexable) return choice;
-    return TreeWalk::DirChoice{indexed, true};
+    return TreeWalk::DirChoice{indexed, IsUtf8(dir)};
   };
 
   // Merge the walk with the stored documents, both in path byte order.
@@ -288,6 +315,11 @@ void Indexer::Crawl(const std::string& root) {
     if (doc != nullptr && (!more || head_path(doc) < entry.path)) {
       Remove(head_path(doc));  // stored, but no longer there
       ++at;
+      continue;
+    }
+    if (!IsUtf8(entry.path)) {  // nor what lies below: it is not walked
+      Failed(Printable(entry.path), "name is not UTF-8; not indexed");
+      more = walker.Next(&entry);
       continue;
     }
     if (entry.kind == WalkEntry::Kind::kUnreadable) {

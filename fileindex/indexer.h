@@ -8,7 +8,9 @@
 // indexing rules admit (CheckFullPathIndexable) and whose category the
 // governing folder indexes (a file of a type outside the four categories
 // always counts). Symbolic links, FIFOs, sockets and devices are never
-// indexed, nor the platform's hidden folders and preserved names. A path
+// indexed, nor the platform's hidden folders and preserved names, nor a
+// name that is not UTF-8 (the search daemon's requests are UTF-8 JSON; a
+// crawl counts such a name as failed and does not go below it). A path
 // that stops qualifying leaves the index.
 //
 // Requests go out in compound batches; commits come every

@@ -178,8 +178,12 @@ void ShareWorker::RunRound() {
     }
   } catch (const Interrupted&) {
     // Stopping: what was sent is committed; the side file keeps the rest.
+    // The hook would throw again after the last flush, before the commit.
     try {
-      if (indexer) indexer->Finish();
+      if (indexer) {
+        indexer->SetBatchHook(nullptr);
+        indexer->Finish();
+      }
     } catch (const Error& e) {
       Log(LOG_ERR, share_ + ": commit at stop failed: code=" + std::to_string(e.GetCode()) +
                        ", reason=" + e.what());
