@@ -15,6 +15,7 @@
 #include "common/root_path.h"
 #include "daemons/fileindexd/indexing_service.h"
 #include "sdk/domain_socket.h"
+#include "tests/support/searchd_process.h"
 #include "tests/support/temp_root.h"
 
 namespace vellis::testing {
@@ -49,12 +50,7 @@ class FileindexdProcess {
   // Sends `sig` and returns the exit status, or minus the signal; -1000
   // when none ran. Never signals without a daemon: kill(-1) would reach
   // every process.
-  int Stop(int sig) {
-    int status = 0;
-    if (pid_ <= 0 || kill(pid_, sig) != 0 || waitpid(pid_, &status, 0) != pid_) return -1000;
-    pid_ = -1;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
-  }
+  int Stop(int sig) { return StopChild(&pid_, sig); }
   // Sends `sig` without waiting (SIGSTOP, SIGCONT). False without a daemon.
   bool Signal(int sig) { return pid_ > 0 && kill(pid_, sig) == 0; }
   // True while the daemon has not exited; an exited one is reaped, its

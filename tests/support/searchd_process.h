@@ -15,6 +15,16 @@
 
 namespace vellis::testing {
 
+// Stops the child `*pid` with `sig`, reaps it and clears `*pid`. Returns its
+// exit status, or minus the signal that ended it; -1000 when none ran.
+// Never signals without a child: kill(-1) would reach every process.
+inline int StopChild(pid_t* pid, int sig) {
+  int status = 0;
+  if (*pid <= 0 || kill(*pid, sig) != 0 || waitpid(*pid, &status, 0) != *pid) return -1000;
+  *pid = -1;
+  return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+}
+
 class SearchdProcess {
  public:
   // Stops a daemon that still runs (SIGKILL).
@@ -38,12 +48,7 @@ class SearchdProcess {
   // Sends `sig` and returns the exit status, or minus the signal; -1000
   // when none ran. Never signals without a daemon: kill(-1) would reach
   // every process.
-  int Stop(int sig) {
-    int status = 0;
-    if (pid_ <= 0 || kill(pid_, sig) != 0 || waitpid(pid_, &status, 0) != pid_) return -1000;
-    pid_ = -1;
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
-  }
+  int Stop(int sig) { return StopChild(&pid_, sig); }
 
   pid_t pid() const { return pid_; }
   const std::string& bin() const { return bin_; }
