@@ -41,6 +41,14 @@ void AppendLine(const std::string& queue_path, const std::string& line) {
 
 }  // namespace
 
+void AppendQueueLines(const std::string& queue_path, const std::string& lines) {
+  // The queue's folder may not exist before the share's first event; a
+  // failure shows when the lock or the queue is opened.
+  MakeDirs(Dirname(queue_path));
+  LockFile lock(QueueLockPath(queue_path), true);
+  AppendLine(queue_path, lines);
+}
+
 void AddCustomEvent(int event, const std::string& path, const std::string& path_old,
                     const Json::Value& data) {
   std::string share_name;
@@ -56,11 +64,7 @@ void AddCustomEvent(int event, const std::string& path, const std::string& path_
     line["data"] = data;
     const std::string text = JsonToString(line) + "\n";
 
-    // The queue's folder may not exist before the share's first event;
-    // a failure shows when the lock or the queue is opened.
-    MakeDirs(Dirname(queue_path));
-    LockFile lock(QueueLockPath(queue_path), true);
-    AppendLine(queue_path, text);
+    AppendQueueLines(queue_path, text);
     return;
   } catch (const Error& e) {
     VELLIS_LOG_ERRNO("AddCustomEvent failed, code=%d, reason=%s. Set [%s] need reindex",

@@ -179,4 +179,12 @@ int NotifyLackOfMemory();
 void AddCustomEvent(int event, const std::string& path, const std::string& path_old,
                     const Json::Value& data);
 
+// Appends `lines` (whole lines, each ending in a newline) to the queue file
+// `queue_path` as AddCustomEvent does: under the queue's lock, with one
+// write(2) on an O_APPEND descriptor, creating the queue and its folder when
+// missing and refusing a queue that is not a regular file. Throws Error 502
+// with the reason when the queue cannot be opened or written, and the
+// lock's errors.
+void AppendQueueLines(const std::string& queue_path, const std::string& lines);
+
 }  // namespace vellis::fileindex
