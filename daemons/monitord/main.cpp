@@ -30,8 +30,6 @@
 
 namespace {
 
-constexpr char kStatusPath[] = "/var/run/vellis-monitord.status";
-
 void Log(int priority, const std::string& text) {
   vellis::sdk::GetPlatform()->Syslog(priority, text);
 }
@@ -44,7 +42,7 @@ int64_t MonotonicMs() {
 
 // Replaces the status file in one step, so readers see the old or the new.
 void WriteStatus(const Json::Value& status) {
-  const std::string path = vellis::RootPath(kStatusPath);
+  const std::string path = vellis::RootPath(vellis::sdk::kMonitorStatusFile);
   const std::string tmp = path + ".tmp";
   {
     std::ofstream out(tmp, std::ios::trunc);

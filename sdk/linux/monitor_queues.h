@@ -19,6 +19,8 @@ namespace vellis::sdk {
 // RootPath() at use.
 inline constexpr char kMonitorQueueDir[] = "/var/packages/Vellis/etc/monitor";
 inline constexpr char kMonitorQueueLockPrefix[] = "/tmp/vellis_monitor_";
+// What the running monitor reports of itself (JSON, replaced each second).
+inline constexpr char kMonitorStatusFile[] = "/var/run/vellis-monitord.status";
 
 // The configuration file of `app` under the root: "<dir>/<app>.json". Empty
 // when `app` cannot name a file (empty, ".", "..", or holding "/" or NUL).

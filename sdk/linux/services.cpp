@@ -28,6 +28,7 @@ namespace {
 constexpr ServiceMapping kServices[] = {
     {"samba", "smbd.service", nullptr},
     {kSearchService, "vellis-searchd.service", "vellis-searchd"},
+    {kMonitorService, "vellis-monitord.service", "vellis-monitord"},
     {"qorucontentextractd", "vellis-extractd.service", "vellis-extractd"},
     {"pkg-Vellis-fileindexd", "vellis-fileindexd.service", "vellis-fileindexd"},
 };
@@ -260,6 +261,17 @@ int Control(const std::string& service, Action action, bool wait) {
   }
   if (HasSystemd()) return Systemctl(*s, action, wait);
   if (!s->program) return SambaInitScript(action);
+  // The indexing daemon needs the changes that the monitor reports: the
+  // monitor comes and goes with it (under systemd its unit wants it).
+  if (strcmp(s->program, "vellis-fileindexd") == 0 &&
+      access(ServiceProgramPath("vellis-monitord").c_str(), X_OK) == 0) {
+    const int rc =
+        action == Action::kStop ? StopOwn("vellis-monitord", wait) : StartOwn("vellis-monitord");
+    if (rc != 0) {
+      GetPlatform()->Syslog(LOG_ERR, std::string("Service ") + ActionName(action) +
+                                         " vellis-monitord failed with " + s->service);
+    }
+  }
   switch (action) {
     case Action::kStart:
       return StartOwn(s->program);

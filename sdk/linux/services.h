@@ -29,6 +29,9 @@ inline constexpr char kSystemctlProgram[] = "/bin/systemctl";
 // The search daemon as a service of its own: the appliance starts it with
 // the system, the command line (`vellis services start`) without one.
 inline constexpr char kSearchService[] = "vellis-searchd";
+// The file-change monitor; it also starts and stops with the indexing
+// daemon.
+inline constexpr char kMonitorService[] = "vellis-monitord";
 
 // What an appliance service name stands for here.
 struct ServiceMapping {

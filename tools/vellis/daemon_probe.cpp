@@ -32,6 +32,7 @@ struct Known {
 
 constexpr Known kDaemons[] = {
     {"vellis-searchd", sdk::kSearchService, false},
+    {"vellis-monitord", sdk::kMonitorService, true},
     {"vellis-extractd", fileindex::kContentExtractService, true},
     {"vellis-fileindexd", fileindex::kFileIndexService, true},
 };
@@ -71,6 +72,11 @@ bool Ask(const std::string& program, Json::Value* data) {
   }
 }
 
+// Daemons without a socket of ours answer by running.
+bool NoSocket(const std::string& program) {
+  return program == "vellis-extractd" || program == "vellis-monitord";
+}
+
 bool FoldersIndexed() {
   try {
     return !fileindex::FolderMgr().GetFolders().empty();
@@ -94,7 +100,7 @@ std::vector<DaemonState> ProbeDaemons() {
     d.pid = LivePid(k.program);
     Json::Value data;
     // A daemon without a socket of its own answers by running.
-    d.answers = d.program == "vellis-extractd" ? d.pid > 0 : Ask(k.program, &data);
+    d.answers = NoSocket(d.program) ? d.pid > 0 : Ask(k.program, &data);
     if (d.answers && d.program == "vellis-fileindexd") d.status = data;
     out.push_back(d);
   }
@@ -105,7 +111,7 @@ bool WaitUntilAnswers(const std::string& program, int timeout_ms) {
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(timeout_ms);
   for (;;) {
     Json::Value data;
-    if (program == "vellis-extractd" ? LivePid(program) > 0 : Ask(program, &data)) return true;
+    if (NoSocket(program) ? LivePid(program) > 0 : Ask(program, &data)) return true;
     if (std::chrono::steady_clock::now() >= deadline) return false;
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
   }

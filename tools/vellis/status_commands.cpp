@@ -11,9 +11,12 @@
 #include <vector>
 
 #include "common/error.h"
+#include "common/json_util.h"
+#include "common/root_path.h"
 #include "fileindex/folder.h"
 #include "fileindex/folder_mgr.h"
 #include "fileindex/status_mgr.h"
+#include "sdk/linux/monitor_queues.h"
 #include "sdk/platform.h"
 #include "tools/vellis/commands.h"
 #include "tools/vellis/daemon_probe.h"
@@ -45,6 +48,10 @@ Json::Value Collect() {
     item["should_run"] = d.should_run;
     out["daemons"].append(item);
     if (d.program == "vellis-fileindexd" && d.answers) indexing = d.status;
+    if (d.program == "vellis-monitord" && d.pid > 0) {
+      Json::Value monitor;
+      if (JsonFromFile(monitor, RootPath(sdk::kMonitorStatusFile))) out["monitor"] = monitor;
+    }
   }
   const long long resume = fileindex::StatusMgr().GetPauseInfo();
   out["pause"]["paused"] = resume == 0 || resume > sdk::GetPlatform()->Time();
@@ -112,6 +119,19 @@ void PrintHuman(const Json::Value& st) {
     daemons << "\n";
   }
   std::cout << "daemons:\n" << daemons.str();
+  if (st.isMember("monitor")) {
+    const Json::Value& m = st["monitor"];
+    std::cout << "monitor: " << m["backend"].asString() << ", " << m["folders"].size()
+              << " folders, " << m["watches"].asUInt64() << " watches";
+    if (m["watch_limit"].asUInt64() > 0) std::cout << " of " << m["watch_limit"].asUInt64();
+    std::cout << ", " << static_cast<long long>(m["events_per_second"].asDouble()) << " events/s, "
+              << m["overflows"].asUInt64() << " overflows";
+    if (m["unwatched"].asUInt64() > 0)
+      std::cout << ", " << m["unwatched"].asUInt64() << " folders rescanned (watch limit)";
+    if (m["skipped_names"].asUInt64() > 0)
+      std::cout << ", " << m["skipped_names"].asUInt64() << " names not UTF-8 skipped";
+    std::cout << "\n";
+  }
   const long long resume = st["pause"]["resume_time"].asInt64();
   std::cout << "pause: "
             << (!st["pause"]["paused"].asBool() ? "none"
