@@ -202,9 +202,16 @@ void Indexer::Rename(const std::string& path, const std::string& old_path) {
       CanFullPathBeIndexed(Dirname(old_path))) {
     // Both places index alike: the documents move with the item.
     Flush();
-    el::IndexRename(share_, path, old_path);
-    ++stats_.renamed;
-    return;
+    try {
+      el::IndexRename(share_, path, old_path);
+      ++stats_.renamed;
+      return;
+    } catch (const Error& e) {
+      // Nothing stored at the old place: a rename carried out before (a
+      // round repeated, or reported twice), or never indexed. Indexing the
+      // new place makes it right either way.
+      if (e.GetCode() != el::kErrNoSuchDocument) throw;
+    }
   }
   Remove(old_path);
   if (!now.qualifies) {

@@ -8,10 +8,8 @@
 
 namespace vellis::monitord {
 
-// "inotify", "fanotify", or "auto": fanotify where the kernel and the
-// privileges allow it, else inotify. Null with the reason when the backend
-// asked for cannot run; with "auto", `why` may say why fanotify was passed
-// over.
+// "inotify", "fanotify", or "auto" (inotify, which every local file system
+// supports). Null with the reason when the backend asked for cannot run.
 std::unique_ptr<Watcher> MakeWatcher(const std::string& backend, std::string* why);
 
 }  // namespace vellis::monitord

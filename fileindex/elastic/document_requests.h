@@ -11,6 +11,10 @@
 
 namespace vellis::fileindex::elastic {
 
+// The search daemon's error code for a request on a document that its index
+// does not hold (a rename of a path already renamed, say).
+inline constexpr int kErrNoSuchDocument = 1107;
+
 // {"command": command, "data": data}.
 Json::Value MakeRequest(const char* command, Json::Value data);
 // {"id": GetFileIndexID(share)}.

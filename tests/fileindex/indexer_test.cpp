@@ -126,6 +126,12 @@ TEST_F(IndexerTest, DeleteRenameAndAttributeFollowTheFiles) {
   EXPECT_EQ(Stored(),
             (Strings{"/all/sub", "/all/sub/s.mp3", "/all/sub/s.txt", "/docs", "/docs/a2.txt"}));
   EXPECT_EQ(indexer_->stats().renamed, 1u);
+  // The same rename again (a round repeated after a crash, or reported
+  // twice): nothing at the old place, and the index stays right.
+  Run(FILE_INDEX_OP_RENAME, "/docs/a2.txt", "/docs/a.txt");
+  EXPECT_EQ(Stored(),
+            (Strings{"/all/sub", "/all/sub/s.mp3", "/all/sub/s.txt", "/docs", "/docs/a2.txt"}));
+  EXPECT_EQ(indexer_->stats().renamed, 1u);
 
   Run(FILE_INDEX_OP_ATTR, "/docs/a2.txt");
   ASSERT_EQ(unlink((share_ + "/all/sub/s.mp3").c_str()), 0);

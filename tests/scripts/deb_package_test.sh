@@ -50,8 +50,8 @@ dpkg-deb -c "$deb" | awk '{print $1, $6}' > "$work/list"
 has() {  # has MODE_PREFIX PATH: the listing holds PATH with a mode starting so
   grep -q "^$1[^ ]* \./$2\$" "$work/list" || fail "the package has no $2 (mode $1...)"
 }
-for p in vellis vellis-notify vellis-searchd vellis-fileindexd; do has -rwxr-xr-x "usr/bin/$p"; done
-for u in vellis-searchd.service vellis-fileindexd.service; do has -rw-r--r-- "usr/lib/systemd/system/$u"; done
+for p in vellis vellis-notify vellis-searchd vellis-fileindexd vellis-monitord; do has -rwxr-xr-x "usr/bin/$p"; done
+for u in vellis-searchd.service vellis-fileindexd.service vellis-monitord.service; do has -rw-r--r-- "usr/lib/systemd/system/$u"; done
 has -rw-r--r-- usr/share/doc/vellis/README.md
 has -rw-r--r-- usr/share/doc/vellis/docs/install.md
 grep -Eq '^l[^ ]* \./usr/lib/([^/]+/)?libfileindex\.so\.0$' "$work/list" ||
@@ -63,7 +63,7 @@ outside=$(awk '{print $2}' "$work/list" | grep -v '^\./usr/' | grep -vx '\./')
 
 # The units run programs of the package.
 dpkg-deb -x "$deb" "$work/tree"
-for u in vellis-searchd vellis-fileindexd; do
+for u in vellis-searchd vellis-fileindexd vellis-monitord; do
   exe=$(sed -n 's/^ExecStart=\([^ ]*\).*/\1/p' "$work/tree/usr/lib/systemd/system/$u.service")
   [ "$exe" = "/usr/bin/$u" ] || fail "$u.service runs [$exe], expected /usr/bin/$u"
 done

@@ -38,8 +38,8 @@ unitdir=$(under_prefix "$(cache_value VELLIS_SYSTEMD_UNIT_DIR)")
 [ -n "$bindir" ] && [ -n "$libdir" ] && [ -n "$docdir" ] && [ -n "$unitdir" ] ||
   fail "install folders missing from $build/CMakeCache.txt"
 
-programs="vellis vellis-notify vellis-searchd vellis-fileindexd"
-units="vellis-searchd.service vellis-fileindexd.service"
+programs="vellis vellis-notify vellis-searchd vellis-fileindexd vellis-monitord"
+units="vellis-searchd.service vellis-fileindexd.service vellis-monitord.service"
 
 # Programs: present, executable, and alone in the bin folder.
 for p in $programs; do

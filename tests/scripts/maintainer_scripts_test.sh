@@ -39,7 +39,7 @@ STUB
   chmod +x "$stubs/$tool"
 done
 
-UNITS="vellis-searchd.service vellis-fileindexd.service"
+UNITS="vellis-searchd.service vellis-fileindexd.service vellis-monitord.service"
 # The scripts must name every unit the package installs, and no other.
 shipped=$(cd "$packaging/systemd" && ls *.service.in | sed 's/\.in$//' | sort)
 for script in postinst prerm postrm; do
@@ -88,7 +88,10 @@ deb-systemd-helper --quiet was-enabled vellis-searchd.service
 deb-systemd-helper enable vellis-searchd.service
 deb-systemd-helper unmask vellis-fileindexd.service
 deb-systemd-helper --quiet was-enabled vellis-fileindexd.service
-deb-systemd-helper enable vellis-fileindexd.service"
+deb-systemd-helper enable vellis-fileindexd.service
+deb-systemd-helper unmask vellis-monitord.service
+deb-systemd-helper --quiet was-enabled vellis-monitord.service
+deb-systemd-helper enable vellis-monitord.service"
 run prerm remove
 expect_calls "prerm without systemd" ""
 run postrm remove
@@ -112,6 +115,9 @@ deb-systemd-helper enable vellis-searchd.service
 deb-systemd-helper unmask vellis-fileindexd.service
 deb-systemd-helper --quiet was-enabled vellis-fileindexd.service
 deb-systemd-helper enable vellis-fileindexd.service
+deb-systemd-helper unmask vellis-monitord.service
+deb-systemd-helper --quiet was-enabled vellis-monitord.service
+deb-systemd-helper enable vellis-monitord.service
 systemctl --system daemon-reload
 deb-systemd-invoke start $UNITS"
 STUB_WAS_ENABLED=1 run postinst configure 0.0.9
@@ -121,11 +127,14 @@ deb-systemd-helper update-state vellis-searchd.service
 deb-systemd-helper unmask vellis-fileindexd.service
 deb-systemd-helper --quiet was-enabled vellis-fileindexd.service
 deb-systemd-helper update-state vellis-fileindexd.service
+deb-systemd-helper unmask vellis-monitord.service
+deb-systemd-helper --quiet was-enabled vellis-monitord.service
+deb-systemd-helper update-state vellis-monitord.service
 systemctl --system daemon-reload
 deb-systemd-invoke restart $UNITS"
 run prerm remove
 expect_calls "prerm remove with systemd" \
-  "deb-systemd-invoke stop vellis-fileindexd.service vellis-searchd.service"
+  "deb-systemd-invoke stop vellis-monitord.service vellis-fileindexd.service vellis-searchd.service"
 run prerm upgrade 0.2.0
 expect_calls "prerm upgrade" ""
 run postrm remove
@@ -138,8 +147,8 @@ expect_calls "postinst with systemctl only" "systemctl --system daemon-reload
 systemctl enable $UNITS
 systemctl start $UNITS"
 TOOLS="systemctl" run prerm remove
-expect_calls "prerm with systemctl only" "systemctl stop vellis-fileindexd.service vellis-searchd.service
-systemctl disable vellis-fileindexd.service vellis-searchd.service"
+expect_calls "prerm with systemctl only" "systemctl stop vellis-monitord.service vellis-fileindexd.service vellis-searchd.service
+systemctl disable vellis-monitord.service vellis-fileindexd.service vellis-searchd.service"
 
 # Every tool failing: the scripts still succeed (run() fails otherwise).
 for script_args in "postinst configure" "postinst configure 0.0.9" "prerm remove" \

@@ -75,7 +75,8 @@ TEST_F(CliServicesTest, StartStatusAndStopFollowWhatRuns) {
       {"services status", 1, "...vellis-fileindexd  yes ... no\n"},
       {"services start", 0, "vellis-searchd: running...vellis-fileindexd: started\n"},
       {"services status", 0, "..."},
-      {"services stop", 0, "vellis-fileindexd: stopped\nvellis-searchd: stopped\n"},
+      {"services stop", 0,
+       "vellis-fileindexd: stopped\nvellis-monitord: stopped\nvellis-searchd: stopped\n"},
       {"services status", 1, "..."},
   });
   EXPECT_NE(DaemonPid("vellis-fileindexd"), pid);
