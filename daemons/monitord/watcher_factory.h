@@ -8,8 +8,9 @@
 
 namespace vellis::monitord {
 
-// "inotify", "fanotify", or "auto" (inotify, which every local file system
-// supports). Null with the reason when the backend asked for cannot run.
+// "inotify", "fanotify", or "auto" (AutoWatcher: fanotify where it can
+// mark a root's file system, inotify elsewhere). Null with the reason when
+// the backend asked for cannot run.
 std::unique_ptr<Watcher> MakeWatcher(const std::string& backend, std::string* why);
 
 }  // namespace vellis::monitord
