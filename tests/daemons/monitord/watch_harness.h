@@ -11,6 +11,8 @@
 #include <time.h>
 
 #include <cstdint>
+#include <cstdio>
+#include <cstdlib>
 #include <functional>
 #include <map>
 #include <memory>
@@ -82,9 +84,17 @@ class WatchHarness {
     std::vector<FsEvent> events;
     watcher_->Read(&events);
     const int64_t now = NowMs();
-    for (const FsEvent& e : events) router_.Take(e, now);
+    static const bool trace = getenv("VELLIS_MONITOR_TRACE") != nullptr;
+    for (const FsEvent& e : events) {
+      if (trace) {
+        fprintf(stderr, "event %d %s%s cookie=%u\n", static_cast<int>(e.kind), e.path.c_str(),
+                e.is_dir ? "/" : "", e.cookie);
+      }
+      router_.Take(e, now);
+    }
     pending_ = router_.Flush(now) >= 0;
     for (auto& [queue, text] : router_.TakeLines()) {
+      if (trace) fprintf(stderr, "lines %s:\n%s", queue.c_str(), text.c_str());
       raw_[queue] += text;
       size_t start = 0;
       while (start < text.size()) {
