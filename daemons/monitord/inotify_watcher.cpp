@@ -6,6 +6,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <fstream>
@@ -50,9 +51,15 @@ bool InotifyWatcher::AddTree(const std::string& root) {
   }
   const int wd = inotify_add_watch(fd_, root.c_str(), kDirMask);
   if (wd < 0) return false;
+  const bool is_root = std::find(roots_.begin(), roots_.end(), root) != roots_.end();
+  auto known = watches_.find(root);
+  if (is_root && known != watches_.end() && known->second == wd) return true;  // the same folder
+  // A folder that took the place of the one watched under this name: the
+  // old watches are forgotten.
+  if (known != watches_.end()) DropDir(root, true);
   paths_[wd] = root;
   watches_[root] = wd;
-  roots_.push_back(root);
+  if (!is_root) roots_.push_back(root);
   std::vector<FsEvent> none;
   AddDir(root, false, &none);
   return true;
