@@ -167,6 +167,9 @@ void InotifyWatcher::Read(std::vector<FsEvent>* out) {
         paths_.erase(ev->wd);
         continue;
       }
+      // A folder's own change is also reported by its parent's watch, but
+      // for a root, whose parent is not watched.
+      if (ev->len == 0 && std::find(roots_.begin(), roots_.end(), dir) == roots_.end()) continue;
       const std::string path = ev->len > 0 ? Join(dir, ev->name) : dir;
       const bool is_dir = (ev->mask & IN_ISDIR) != 0;
       if (ev->mask & IN_CREATE) {
