@@ -194,6 +194,10 @@ void InotifyWatcher::Read(std::vector<FsEvent>* out) {
         for (auto it = dirs_out.begin(); it != dirs_out.end(); ++it) {
           if (it->cookie != ev->cookie) continue;
           MoveDir(it->path, path);
+          // Folders made below it just before the rename may have been
+          // looked for under the old name and missed: watched now. What
+          // they hold is reported by the indexer's crawl of their creation.
+          AddDir(path, false, out);
           dirs_out.erase(it);
           paired = true;
           break;
