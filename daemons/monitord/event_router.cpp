@@ -121,8 +121,21 @@ void EventRouter::Moved(const std::string& from, const std::string& to, bool is_
   if (b) to_ok ? Emit(kEventCreate, to, is_dir) : Valid(to);
 }
 
+void EventRouter::SettleMovesAt(const std::string& path) {
+  for (auto it = moves_.begin(); it != moves_.end();) {
+    if (!Covers(it->path, path) && !Covers(path, it->path)) {
+      ++it;
+      continue;
+    }
+    const PendingMove m = *it;
+    it = moves_.erase(it);
+    Moved(m.path, "", m.is_dir);  // moved out of what is watched
+  }
+}
+
 void EventRouter::Take(const FsEvent& e, int64_t now_ms) {
   ++stats_.events;
+  if (e.kind != FsEventKind::kMovedTo && e.kind != FsEventKind::kOverflow) SettleMovesAt(e.path);
   switch (e.kind) {
     case FsEventKind::kCreate:
       Emit(kEventCreate, e.path, e.is_dir);
@@ -153,9 +166,11 @@ void EventRouter::Take(const FsEvent& e, int64_t now_ms) {
         if (it->cookie != e.cookie) continue;
         const std::string from = it->path;
         moves_.erase(it);
+        SettleMovesAt(e.path);
         Moved(from, e.path, e.is_dir);
         return;
       }
+      SettleMovesAt(e.path);
       Moved("", e.path, e.is_dir);  // from outside what is watched
       break;
     }

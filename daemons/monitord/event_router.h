@@ -92,6 +92,10 @@ class EventRouter {
   bool Emit(uint32_t bit, const std::string& path, bool is_dir, const std::string& path_old = "");
   bool Valid(const std::string& path);
   void Moved(const std::string& from, const std::string& to, bool is_dir);
+  // Emits at once the halves still waiting whose name is `path`, above or
+  // below it: a name reused within the grace must not see the delete of
+  // what left it come after the lines of what now sits there.
+  void SettleMovesAt(const std::string& path);
 
   RouterOptions options_;
   std::vector<WatchedFolder> folders_;

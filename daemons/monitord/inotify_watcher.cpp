@@ -6,6 +6,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <fstream>
@@ -50,9 +51,15 @@ bool InotifyWatcher::AddTree(const std::string& root) {
   }
   const int wd = inotify_add_watch(fd_, root.c_str(), kDirMask);
   if (wd < 0) return false;
+  const bool is_root = std::find(roots_.begin(), roots_.end(), root) != roots_.end();
+  auto known = watches_.find(root);
+  if (is_root && known != watches_.end() && known->second == wd) return true;  // the same folder
+  // A folder that took the place of the one watched under this name: the
+  // old watches are forgotten.
+  if (known != watches_.end()) DropDir(root, true);
   paths_[wd] = root;
   watches_[root] = wd;
-  roots_.push_back(root);
+  if (!is_root) roots_.push_back(root);
   std::vector<FsEvent> none;
   AddDir(root, false, &none);
   return true;
@@ -160,6 +167,9 @@ void InotifyWatcher::Read(std::vector<FsEvent>* out) {
         paths_.erase(ev->wd);
         continue;
       }
+      // A folder's own change is also reported by its parent's watch, but
+      // for a root, whose parent is not watched.
+      if (ev->len == 0 && std::find(roots_.begin(), roots_.end(), dir) == roots_.end()) continue;
       const std::string path = ev->len > 0 ? Join(dir, ev->name) : dir;
       const bool is_dir = (ev->mask & IN_ISDIR) != 0;
       if (ev->mask & IN_CREATE) {
@@ -184,6 +194,10 @@ void InotifyWatcher::Read(std::vector<FsEvent>* out) {
         for (auto it = dirs_out.begin(); it != dirs_out.end(); ++it) {
           if (it->cookie != ev->cookie) continue;
           MoveDir(it->path, path);
+          // Folders made below it just before the rename may have been
+          // looked for under the old name and missed: watched now. What
+          // they hold is reported by the indexer's crawl of their creation.
+          AddDir(path, false, out);
           dirs_out.erase(it);
           paired = true;
           break;

@@ -76,7 +76,9 @@ void Monitor::Reload() {
       why = "is a symbolic link";
     } else if (!S_ISDIR(st.st_mode)) {
       why = "is not a folder";
-    } else if (!watched_.count(f.path) && !roots.count(f.path) && !watcher_->AddTree(f.path)) {
+    } else if (!roots.count(f.path) && !watcher_->AddTree(f.path)) {
+      // Also for a folder already watched: one deleted and made again since
+      // is watched anew.
       why = std::string("cannot be watched: ") + strerror(errno);
     }
     if (!why.empty()) {

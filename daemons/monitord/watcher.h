@@ -46,6 +46,8 @@ class Watcher {
   // folder created below a root is watched before it is read, and what it
   // already holds is reported as created, so nothing made in between is
   // missed. Returns false with errno set when `root` cannot be watched.
+  // Given again, a root still watched is left as it is; one whose folder
+  // was deleted and made again is watched anew.
   virtual bool AddTree(const std::string& root) = 0;
 
   // Stops reporting below `root`.
