@@ -195,9 +195,21 @@ void Indexer::UpsertOne(const std::string& path) {
   }
 }
 
+// Memory stays bounded in a round of many renames; beyond this the next
+// crawl makes good what is missed.
+constexpr size_t kLostRenamesKept = 10000;
+
 void Indexer::Rename(const std::string& path, const std::string& old_path) {
   const Place now = Judge(path, true);
   std::shared_ptr<Folder> before = folders_.GetMostSuitableCfg(old_path);
+  if (!now.exists) {
+    // Gone again before this round: deleted, or renamed on. What is stored
+    // goes (nothing stale stays); should a later rename of a folder above
+    // it bring it back, that rename indexes it at its last place.
+    Remove(old_path);
+    if (lost_renames_.size() < kLostRenamesKept) lost_renames_.push_back(path);
+    return;
+  }
   if (now.qualifies && before && SameCategories(*before, *now.folder) &&
       CanFullPathBeIndexed(Dirname(old_path))) {
     // Both places index alike: the documents move with the item.
@@ -205,6 +217,7 @@ void Indexer::Rename(const std::string& path, const std::string& old_path) {
     try {
       el::IndexRename(share_, path, old_path);
       ++stats_.renamed;
+      if (now.is_dir) FindLostRenames(path, old_path);
       return;
     } catch (const Error& e) {
       // Nothing stored at the old place: a rename carried out before (a
@@ -220,6 +233,28 @@ void Indexer::Rename(const std::string& path, const std::string& old_path) {
     Crawl(path);
   } else {
     Upsert(path, false);
+  }
+}
+
+void Indexer::FindLostRenames(const std::string& path, const std::string& old_path) {
+  for (auto it = lost_renames_.begin(); it != lost_renames_.end();) {
+    if (!StringStartWith(*it, old_path + "/")) {
+      ++it;
+      continue;
+    }
+    *it = path + it->substr(old_path.size());
+    struct stat st;
+    if (lstat(it->c_str(), &st) != 0) {
+      ++it;  // moved on again: a later rename may still find it
+      continue;
+    }
+    const std::string found = *it;
+    it = lost_renames_.erase(it);
+    if (S_ISDIR(st.st_mode)) {
+      Crawl(found);
+    } else {
+      UpsertOne(found);
+    }
   }
 }
 

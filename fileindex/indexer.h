@@ -104,6 +104,9 @@ class Indexer {
   void Upsert(const std::string& path, bool is_dir);
   void Remove(const std::string& path);
   void Rename(const std::string& path, const std::string& old_path);
+  // After the folder `old_path` was renamed to `path`: indexes the items
+  // of lost_renames_ that are below it and exist there.
+  void FindLostRenames(const std::string& path, const std::string& old_path);
   void Add(Json::Value request);
   void Flush();
   void MaybeCommit();
@@ -114,6 +117,9 @@ class Indexer {
   const FolderMgr& folders_;
   IndexerOptions options_;
   IndexerStats stats_;
+  // New names of renames whose item was gone when the rename ran; a later
+  // rename of a folder above one indexes it at its last place.
+  std::vector<std::string> lost_renames_;
   std::function<void()> hook_;
   Json::Value batch_;  // the pending sub-requests
   uint64_t ops_since_commit_ = 0;

@@ -109,8 +109,14 @@ void InotifyWatcher::AddDir(const std::string& top, bool report, std::vector<FsE
 void InotifyWatcher::DropDir(const std::string& dir, bool remove) {
   auto it = watches_.lower_bound(dir);
   while (it != watches_.end() && (it->first == dir || Below(dir, it->first))) {
-    if (remove) inotify_rm_watch(fd_, it->second);
-    paths_.erase(it->second);
+    // One kernel watch may be known under a second path too (a folder moved
+    // in was found by its new parent's scan first): it stays while that
+    // path holds it.
+    auto owner = paths_.find(it->second);
+    if (owner != paths_.end() && owner->second == it->first) {
+      if (remove) inotify_rm_watch(fd_, it->second);
+      paths_.erase(owner);
+    }
     it = watches_.erase(it);
   }
 }

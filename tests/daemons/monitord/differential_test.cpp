@@ -67,6 +67,9 @@ class ModelIndex {
  public:
   explicit ModelIndex(std::string root) : root_(std::move(root)) { WalkTree(root_, &paths_); }
 
+  // A round is over: what it lost stays lost until the next crawl.
+  void EndRound() { lost_.clear(); }
+
   void Execute(const OP& op) {
     const std::string path = op.node->GetPath();
     switch (op.op) {
@@ -85,19 +88,25 @@ class ModelIndex {
         break;
       case fileindex::FILE_INDEX_OP_RENAME: {
         const Stat now = Look(path);
-        if (now.indexable) {
+        if (!now.exists) {
+          // Gone again: what is stored goes; a later rename of a folder
+          // above it finds it.
+          Remove(op.path_old);
+          lost_.push_back(path);
+        } else if (now.indexable && !paths_.count(op.path_old)) {
+          // Nothing stored at the old place (renamed again, or repeated):
+          // the new place is indexed instead.
+          Remove(op.path_old);
+          if (now.is_dir) {
+            Crawl(path);
+          } else {
+            UpsertOne(path);
+          }
+        } else if (now.indexable) {
           // The documents move with the item.
           Remove(path);
-          std::set<std::string> moved;
-          for (auto it = paths_.begin(); it != paths_.end();) {
-            if (*it == op.path_old || Below(op.path_old, *it)) {
-              moved.insert(path + it->substr(op.path_old.size()));
-              it = paths_.erase(it);
-            } else {
-              ++it;
-            }
-          }
-          paths_.insert(moved.begin(), moved.end());
+          MovePrefix(op.path_old, path);
+          if (now.is_dir) FindLost(path, op.path_old);
         } else {
           Remove(op.path_old);
           if (now.exists) Remove(path);
@@ -125,6 +134,40 @@ class ModelIndex {
          it != paths_.end() && (*it == path || Below(path, *it));)
       it = paths_.erase(it);
   }
+  void FindLost(const std::string& path, const std::string& old_path) {
+    for (auto it = lost_.begin(); it != lost_.end();) {
+      if (!Below(old_path, *it)) {
+        ++it;
+        continue;
+      }
+      *it = path + it->substr(old_path.size());
+      const Stat st = Look(*it);
+      if (!st.exists) {
+        ++it;
+        continue;
+      }
+      const std::string found = *it;
+      it = lost_.erase(it);
+      if (st.is_dir) {
+        Crawl(found);
+      } else {
+        UpsertOne(found);
+      }
+    }
+  }
+  // What is stored at and below `from` now sits at `to`.
+  void MovePrefix(const std::string& from, const std::string& to) {
+    std::set<std::string> moved;
+    for (auto it = paths_.begin(); it != paths_.end();) {
+      if (*it == from || Below(from, *it)) {
+        moved.insert(to + it->substr(from.size()));
+        it = paths_.erase(it);
+      } else {
+        ++it;
+      }
+    }
+    paths_.insert(moved.begin(), moved.end());
+  }
   void UpsertOne(const std::string& path) {
     if (Look(path).indexable && Below(root_, path)) {
       paths_.insert(path);
@@ -143,13 +186,13 @@ class ModelIndex {
 
   std::string root_;
   std::set<std::string> paths_;
+  std::vector<std::string> lost_;  // renames whose item was gone, this round
 };
 
 // One random sequence on a fresh tree.
 class Sequence {
  public:
-  Sequence(uint32_t seed, const std::string& base, std::function<void()> between)
-      : rng_(seed), between_(std::move(between)) {
+  Sequence(uint32_t seed, const std::string& base) : rng_(seed) {
     a_ = base + "/A";
     b_ = base + "/B";
     out_ = base + "/out";
@@ -305,20 +348,8 @@ class Sequence {
     return s;
   }
   void Move(const std::string& from, const std::string& to) {
-    // The library folds no chain of renames: an item renamed again before
-    // its queue is read loses its documents (the first rename finds its
-    // destination gone). The queue is read in between, as the indexer
-    // would between two bursts.
-    for (const std::string& done : renamed_to_) {
-      if (done == from || Below(done, from) || Below(from, done)) {
-        Did("(queue read)");
-        between_();
-        renamed_to_.clear();
-        break;
-      }
-    }
     Did("mv " + from + " " + to);
-    if (rename(from.c_str(), to.c_str()) == 0) renamed_to_.insert(to);
+    rename(from.c_str(), to.c_str());
   }
   static void RemoveAll(const std::string& dir) {
     std::set<std::string> below = Walk(dir);
@@ -327,11 +358,9 @@ class Sequence {
   }
 
   std::mt19937 rng_;
-  std::function<void()> between_;  // reads the queues into the index
   std::string a_, b_, out_;
   std::vector<std::string> log_;
   std::vector<std::pair<std::string, std::string>> outside_;
-  std::set<std::string> renamed_to_;  // since the queue was last read  // where it is, where it was
   int names_ = 0;
 };
 
@@ -367,10 +396,11 @@ std::string RunOne(uint32_t seed, int ops) {
         folded += os.str();
         model->Execute(*op);
       });
+      model->EndRound();
     }
     h.Clear();
   };
-  Sequence seq(seed, tmp.path(), read_queues);
+  Sequence seq(seed, tmp.path());
   h.Watch(seq.a(), tmp.Path("/qa"));
   h.Watch(seq.b(), tmp.Path("/qb"));
   if (!h.Settle(0)) return "never settled before the start";
