@@ -19,4 +19,10 @@ int NotifyLackOfMemory() {
                                          "app:displayname", "error:lack_of_memory"});
 }
 
+int NotifyWatchLimit() {
+  return sdk::GetPlatform()->QLIBCExecl(
+      kHmxNotifyPath, kNotifyExecOption,
+      {"-c", "QORU.Vellis.Application", "@administrators", "app:displayname", "error:watch_limit"});
+}
+
 }  // namespace vellis::fileindex

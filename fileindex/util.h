@@ -151,6 +151,9 @@ inline constexpr int kNotifyExecOption = 187;
 // process runner's result; never throw, never log.
 int SendHMXNotify();
 int NotifyLackOfMemory();
+// Tells the administrators that the file-change monitor reached the
+// kernel's watch limit and rescans instead ("error:watch_limit").
+int NotifyWatchLimit();
 
 // --- Custom events (custom_event.cpp) ---
 //

@@ -82,9 +82,9 @@ bool EventRouter::Valid(const std::string& path) {
 }
 
 bool EventRouter::Emit(uint32_t bit, const std::string& path, bool is_dir,
-                       const std::string& path_old) {
+                       const std::string& path_old, bool masked) {
   const WatchedFolder* folder = Route(path);
-  if (!folder || (folder->mask & bit) == 0) return false;
+  if (!folder || (masked && (folder->mask & bit) == 0)) return false;
   if (!Valid(path) || (!path_old.empty() && !Valid(path_old))) return false;
   Json::Value line(Json::objectValue);
   line["event"] = bit;
@@ -201,7 +201,10 @@ int64_t EventRouter::Flush(int64_t now_ms) {
   return due;
 }
 
-bool EventRouter::Reindex(const std::string& path) { return Emit(kEventReindex, path, true); }
+bool EventRouter::Reindex(const std::string& path) {
+  // The monitor's own making good, like the crash marker: no mask holds it.
+  return Emit(kEventReindex, path, true, "", false);
+}
 
 void EventRouter::CrashMarker(const std::string& root) {
   std::set<std::string> done;

@@ -62,8 +62,9 @@ class EventRouter {
   // when nothing waits.
   int64_t Flush(int64_t now_ms);
 
-  // A reindex line (0x10000) for `path`, e.g. a folder that cannot be
-  // watched and is rescanned instead. False when no folder covers it.
+  // A reindex line (0x10000) for `path`, whatever the folder's mask: a
+  // folder that cannot be watched and is rescanned instead, or one on a
+  // file system that reports nothing. False when no folder covers it.
   bool Reindex(const std::string& path);
 
   // The crash marker in the queue of every folder at or below `root`, or in
@@ -89,7 +90,8 @@ class EventRouter {
   const WatchedFolder* Route(const std::string& path) const;
   // The line of one change, when the folder's mask has the bit and the
   // names are UTF-8. False when it was left out.
-  bool Emit(uint32_t bit, const std::string& path, bool is_dir, const std::string& path_old = "");
+  bool Emit(uint32_t bit, const std::string& path, bool is_dir, const std::string& path_old = "",
+            bool masked = true);
   bool Valid(const std::string& path);
   void Moved(const std::string& from, const std::string& to, bool is_dir);
   // Emits at once the halves still waiting whose name is `path`, above or

@@ -121,6 +121,10 @@ int64_t Monitor::Step() {
       Log(LOG_WARNING, "monitord: watch limit reached: " + dir +
                            " is rescanned instead of watched (raise fs.inotify.max_user_watches)");
       router_.CrashMarker(dir);
+      if (!limit_notified_) {
+        fileindex::NotifyWatchLimit();  // once: the log says the rest
+        limit_notified_ = true;
+      }
     }
   }
   for (auto& [dir, at] : rescan_due_) {

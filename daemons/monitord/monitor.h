@@ -67,6 +67,7 @@ class Monitor {
   std::map<std::string, int64_t> network_due_;    // folder -> next reindex
   std::map<std::string, int64_t> rescan_due_;     // unwatched folder -> next rescan
   std::map<std::string, std::string> unwritten_;  // queue -> lines not yet written
+  bool limit_notified_ = false;                   // the administrators were told
   std::vector<std::string> errors_;               // the last ones
   // Events per second: the count at the start of the current second.
   int64_t rate_at_ms_ = 0;
