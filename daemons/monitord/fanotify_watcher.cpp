@@ -268,18 +268,24 @@ void FanotifyWatcher::Read(std::vector<FsEvent>* out) {
     ssize_t n = read(fd_, buf, sizeof(buf));
     if (n < 0 && errno == EINTR) continue;
     if (n <= 0) return;  // EAGAIN: drained
-    const auto* meta = reinterpret_cast<const struct fanotify_event_metadata*>(buf);
-    size_t left = static_cast<size_t>(n);
-    for (; FAN_EVENT_OK(meta, left); meta = FAN_EVENT_NEXT(meta, left)) {
-      if (meta->vers != FANOTIFY_METADATA_VERSION) return;
-      if (meta->fd >= 0) close(meta->fd);  // never with handles, but own it anyway
-      if (meta->mask & FAN_Q_OVERFLOW) {
+    // Records follow each other at the lengths the kernel gives, which
+    // keep no 8-byte alignment: each header is copied out before use.
+    size_t at = 0;
+    const size_t total = static_cast<size_t>(n);
+    while (total - at >= sizeof(struct fanotify_event_metadata)) {
+      struct fanotify_event_metadata meta;
+      memcpy(&meta, buf + at, sizeof(meta));
+      if (meta.event_len < sizeof(meta) || meta.event_len > total - at) break;
+      if (meta.vers != FANOTIFY_METADATA_VERSION) return;
+      const char* record = buf + at;
+      at += meta.event_len;
+      if (meta.fd >= 0) close(meta.fd);  // never with handles, but own it anyway
+      if (meta.mask & FAN_Q_OVERFLOW) {
         out->push_back(FsEvent{FsEventKind::kOverflow, ""});
         folders_.Clear();  // renames may have been lost
         continue;
       }
-      const char* info = reinterpret_cast<const char*>(meta) + meta->metadata_len;
-      HandleEvent(meta->mask, info, meta->event_len - meta->metadata_len, out);
+      HandleEvent(meta.mask, record + meta.metadata_len, meta.event_len - meta.metadata_len, out);
     }
   }
 }
