@@ -98,14 +98,13 @@ inline std::string DescribeExit(int status) {
   return "status " + std::to_string(status);
 }
 
-// A daemon of this build as a child process in the foreground, its
-// standard error in a log file.
-class Daemon {
+// A program of this build as a child process, its standard error in a log
+// file. Only ever signals the child that it started.
+class ChildProcess {
  public:
-  ~Daemon() { Stop(); }
+  ~ChildProcess() { Stop(); }
 
-  void Start(const std::string& bin, const std::vector<std::string>& args, const std::string& log,
-             const std::string& socket) {
+  void Spawn(const std::string& bin, const std::vector<std::string>& args, const std::string& log) {
     bin_ = bin;
     log_ = log;
     pid_ = fork();
@@ -119,20 +118,9 @@ class Daemon {
       execv(bin.c_str(), argv.data());
       _exit(127);
     }
-    for (int i = 0; i < 1000; ++i, Sleep(10)) {
-      if (sdk::DomainSockConnection(socket).Connect()) return;
-      int status = 0;
-      if (waitpid(pid_, &status, WNOHANG) == pid_) {
-        pid_ = -1;
-        throw std::runtime_error(bin + " exited at start (" + DescribeExit(status) + "); see " +
-                                 log);
-      }
-    }
-    throw std::runtime_error(bin + " did not open " + socket + " within 10 s");
   }
 
-  // SIGTERM, up to 10 s for a clean stop, then SIGKILL. Only ever signals a
-  // child that this object started.
+  // SIGTERM, up to 10 s for a clean stop, then SIGKILL.
   void Stop() {
     if (pid_ <= 0) return;
     kill(pid_, SIGTERM);
@@ -148,7 +136,7 @@ class Daemon {
     pid_ = -1;
   }
 
-  // Throws when the daemon has exited.
+  // Throws when the child has exited.
   void CheckAlive() {
     int status = 0;
     if (pid_ > 0 && waitpid(pid_, &status, WNOHANG) == pid_) {
@@ -159,10 +147,26 @@ class Daemon {
 
   pid_t pid() const { return pid_; }
 
- private:
+ protected:
   std::string bin_;
   std::string log_;
   pid_t pid_ = -1;
+};
+
+// A daemon of this build in the foreground, ready once its socket takes
+// connections.
+class Daemon : public ChildProcess {
+ public:
+  void Start(const std::string& bin, const std::vector<std::string>& args, const std::string& log,
+             const std::string& socket) {
+    Spawn(bin, args, log);
+    for (int i = 0; i < 1000; ++i, Sleep(10)) {
+      if (sdk::DomainSockConnection(socket).Connect()) return;
+      CheckAlive();
+      if (pid_ < 0) break;
+    }
+    throw std::runtime_error(bin + " did not open " + socket + " within 10 s");
+  }
 };
 
 }  // namespace vellis::bench

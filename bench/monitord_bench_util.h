@@ -58,25 +58,11 @@ inline double Percentile(std::vector<double> v, double p) {
 // vellis-monitord -f as a child process, its standard error in a log file.
 // It has no socket: it is ready when its status file shows the folder
 // watched with enough watches.
-class MonitorProcess {
+class MonitorProcess : public ChildProcess {
  public:
-  ~MonitorProcess() { Stop(); }
-
   void Start(const std::string& bin, const std::vector<std::string>& args, const std::string& log) {
-    bin_ = bin;
-    log_ = log;
     unlink(StatusPath().c_str());  // no stale status from an earlier run
-    pid_ = fork();
-    if (pid_ < 0) throw std::runtime_error(std::string("fork: ") + strerror(errno));
-    if (pid_ == 0) {                     // no other threads in this process
-      prctl(PR_SET_PDEATHSIG, SIGKILL);  // never outlive the benchmark
-      if (freopen(log.c_str(), "w", stderr) == nullptr) _exit(126);
-      std::vector<char*> argv = {const_cast<char*>(bin.c_str())};
-      for (const std::string& a : args) argv.push_back(const_cast<char*>(a.c_str()));
-      argv.push_back(nullptr);
-      execv(bin.c_str(), argv.data());
-      _exit(127);
-    }
+    Spawn(bin, args, log);
   }
 
   static std::string StatusPath() { return RootPath(sdk::kMonitorStatusFile); }
@@ -110,38 +96,6 @@ class MonitorProcess {
       }
     }
   }
-
-  // SIGTERM, up to 10 s for a clean stop, then SIGKILL. Only ever signals
-  // the child this object started.
-  void Stop() {
-    if (pid_ <= 0) return;
-    kill(pid_, SIGTERM);
-    for (int i = 0; i < 1000; ++i, Sleep(10)) {
-      if (waitpid(pid_, nullptr, WNOHANG) == pid_) {
-        pid_ = -1;
-        return;
-      }
-    }
-    fprintf(stderr, "%s did not stop within 10 s; killed\n", bin_.c_str());
-    kill(pid_, SIGKILL);
-    waitpid(pid_, nullptr, 0);
-    pid_ = -1;
-  }
-
-  void CheckAlive() {
-    int status = 0;
-    if (pid_ > 0 && waitpid(pid_, &status, WNOHANG) == pid_) {
-      pid_ = -1;
-      throw std::runtime_error(bin_ + " exited (" + DescribeExit(status) + "); see " + log_);
-    }
-  }
-
-  pid_t pid() const { return pid_; }
-
- private:
-  std::string bin_;
-  std::string log_;
-  pid_t pid_ = -1;
 };
 
 // A queue file read as the monitor appends to it: only whole lines are
