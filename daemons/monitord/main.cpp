@@ -103,7 +103,8 @@ int Serve(const std::string& backend, const vellis::monitord::MonitorOptions& op
       monitor.Reload();
     }
   }
-  monitor.Step();  // what was made is written before the end
+  monitor.Step();
+  monitor.Drain();  // what was made is written before the end
   WriteStatus(monitor.Status());
   Log(LOG_INFO, "monitord: stopping");
   close(config_fd);

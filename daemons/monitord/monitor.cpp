@@ -20,6 +20,8 @@ namespace vellis::monitord {
 namespace {
 
 constexpr size_t kErrorsKept = 20;
+// Lines waiting beyond this are written at once.
+constexpr size_t kWriteBytes = 256 * 1024;
 
 void Log(int priority, const std::string& text) { sdk::GetPlatform()->Syslog(priority, text); }
 
@@ -142,8 +144,24 @@ int64_t Monitor::Step() {
     sooner(at);
   }
   for (const std::string& n : router_.TakeNotices()) Log(LOG_NOTICE, "monitord: " + n);
-  WriteLines();
-  if (!unwritten_.empty()) sooner(now + 1000);
+  // Under a stream of changes the lines of a few milliseconds go in one
+  // write: reading the kernel's queue promptly matters more than writing
+  // each line at once.
+  for (auto& [queue, lines] : router_.TakeLines()) {
+    unwritten_[queue] += lines;
+    unwritten_bytes_ += lines.size();
+  }
+  if (!unwritten_.empty()) {
+    if (now - written_at_ms_ >= options_.write_every_ms || unwritten_bytes_ >= kWriteBytes) {
+      WriteLines();
+      written_at_ms_ = now;
+    }
+    if (!unwritten_.empty()) {
+      sooner(unwritten_bytes_ > 0 && now - written_at_ms_ < options_.write_every_ms
+                 ? written_at_ms_ + options_.write_every_ms
+                 : now + 1000);
+    }
+  }
 
   if (now - rate_at_ms_ >= 1000) {
     rate_ = static_cast<double>(router_.stats().events - rate_events_) * 1000.0 /
@@ -154,11 +172,19 @@ int64_t Monitor::Step() {
   return due;
 }
 
+void Monitor::Drain() {
+  for (auto& [queue, lines] : router_.TakeLines()) {
+    unwritten_[queue] += lines;
+    unwritten_bytes_ += lines.size();
+  }
+  WriteLines();
+}
+
 void Monitor::WriteLines() {
-  for (auto& [queue, lines] : router_.TakeLines()) unwritten_[queue] += lines;
   for (auto it = unwritten_.begin(); it != unwritten_.end();) {
     try {
       fileindex::AppendQueueLines(it->first, it->second);
+      unwritten_bytes_ -= it->second.size();
       it = unwritten_.erase(it);
     } catch (const Error& e) {
       // Kept for the next step: a queue folder being recreated, a full disk.

@@ -31,6 +31,7 @@ struct MonitorOptions {
   RouterOptions router;
   int64_t network_reindex_ms = 10 * 60 * 1000;  // folders on NFS, SMB, FUSE
   int64_t rescan_ms = 60 * 1000;                // folders the watch limit left out
+  int64_t write_every_ms = 10;                  // lines made meanwhile go in one write
 };
 
 class Monitor {
@@ -48,6 +49,9 @@ class Monitor {
   // One round; returns the clock time when the next is due, or -1 when only
   // the watcher's descriptor can bring one.
   int64_t Step();
+
+  // Writes every line made so far (at a stop).
+  void Drain();
 
   // {"backend", "folders", "watches", "watch_limit", "unwatched", "events",
   //  "lines", "events_per_second", "overflows", "skipped_names",
@@ -67,8 +71,10 @@ class Monitor {
   std::map<std::string, int64_t> network_due_;    // folder -> next reindex
   std::map<std::string, int64_t> rescan_due_;     // unwatched folder -> next rescan
   std::map<std::string, std::string> unwritten_;  // queue -> lines not yet written
-  bool limit_notified_ = false;                   // the administrators were told
-  std::vector<std::string> errors_;               // the last ones
+  size_t unwritten_bytes_ = 0;
+  int64_t written_at_ms_ = -1000000;  // the last write of lines
+  bool limit_notified_ = false;       // the administrators were told
+  std::vector<std::string> errors_;   // the last ones
   // Events per second: the count at the start of the current second.
   int64_t rate_at_ms_ = 0;
   uint64_t rate_events_ = 0;

@@ -81,6 +81,9 @@ TEST_F(MonitorStepTest, ChangesReachTheirQueueAndOverflowMarksEveryQueue) {
   EXPECT_EQ(Lines(qb_), std::vector<std::string>{"128 " + b_ + "/old"}) << "moved out";
 
   fake_->events = {{FsEventKind::kOverflow, "", false, 0}};
+  EXPECT_EQ(monitor_->Step(), now_ + 10) << "lines soon after a write wait for the next";
+  EXPECT_EQ(Lines(qa_).size(), 1u);
+  now_ += 10;
   monitor_->Step();
   EXPECT_EQ(Lines(qa_).back(), "512 " + a_);
   EXPECT_EQ(Lines(qb_).back(), "512 " + b_);
