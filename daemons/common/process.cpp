@@ -1,8 +1,10 @@
 #include "daemons/common/process.h"
 
 #include <fcntl.h>
+#include <signal.h>
 #include <sys/file.h>
 #include <sys/resource.h>
+#include <sys/signalfd.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -14,6 +16,18 @@
 #include "common/fs_util.h"
 
 namespace vellis::daemon {
+
+int StopSignalDescriptor() {
+  sigset_t stop;
+  sigemptyset(&stop);
+  sigaddset(&stop, SIGTERM);
+  sigaddset(&stop, SIGINT);
+  pthread_sigmask(SIG_BLOCK, &stop, nullptr);
+  signal(SIGPIPE, SIG_IGN);
+  const int fd = signalfd(-1, &stop, SFD_CLOEXEC);
+  if (fd < 0) throw Error(kErrInternal, std::string("signalfd failed: ") + strerror(errno));
+  return fd;
+}
 
 int LogOptions(bool foreground) {
   const char* journal = getenv("JOURNAL_STREAM");

@@ -11,6 +11,12 @@ namespace vellis::daemon {
 // ($JOURNAL_STREAM, set by systemd), where the copy would double each line.
 int LogOptions(bool foreground);
 
+// The stop signals (SIGTERM, SIGINT) as a descriptor to poll: blocks them
+// in this thread and in every thread it starts later (call before starting
+// threads), ignores SIGPIPE, and returns a close-on-exec signalfd. Throws
+// Error kErrInternal when signalfd fails.
+int StopSignalDescriptor();
+
 // The pid file of the program `name`: "/var/run/<name>.pid"; resolve with
 // RootPath() at use.
 std::string PidFilePath(const std::string& name);

@@ -7,7 +7,6 @@
 // SIGINT stop it cleanly: each worker commits what it sent and leaves the
 // rest of its round in the side file.
 #include <signal.h>
-#include <sys/signalfd.h>
 #include <syslog.h>
 #include <time.h>
 #include <unistd.h>
@@ -35,14 +34,7 @@ int64_t EpochMs() {
 
 int Serve(const vellis::fileindexd::WorkerOptions& options) {
   using namespace vellis;
-  sigset_t stop;
-  sigemptyset(&stop);
-  sigaddset(&stop, SIGTERM);
-  sigaddset(&stop, SIGINT);
-  pthread_sigmask(SIG_BLOCK, &stop, nullptr);
-  signal(SIGPIPE, SIG_IGN);
-  int stop_fd = signalfd(-1, &stop, SFD_CLOEXEC);
-  if (stop_fd < 0) throw Error(kErrInternal, "signalfd failed");
+  const int stop_fd = daemon::StopSignalDescriptor();
 
   daemon::RaiseDescriptorLimit();
   daemon::PidFile pid_file(RootPath(daemon::PidFilePath("vellis-fileindexd")));

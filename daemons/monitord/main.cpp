@@ -8,7 +8,6 @@
 #include <poll.h>
 #include <signal.h>
 #include <sys/inotify.h>
-#include <sys/signalfd.h>
 #include <syslog.h>
 #include <time.h>
 #include <unistd.h>
@@ -54,13 +53,7 @@ void WriteStatus(const Json::Value& status) {
 
 int Serve(const std::string& backend, const vellis::monitord::MonitorOptions& options) {
   using namespace vellis;
-  sigset_t stop;
-  sigemptyset(&stop);
-  sigaddset(&stop, SIGTERM);
-  sigaddset(&stop, SIGINT);
-  pthread_sigmask(SIG_BLOCK, &stop, nullptr);
-  const int stop_fd = signalfd(-1, &stop, SFD_CLOEXEC);
-  if (stop_fd < 0) throw Error(kErrInternal, "signalfd failed");
+  const int stop_fd = daemon::StopSignalDescriptor();
 
   daemon::PidFile pid_file(RootPath(daemon::PidFilePath("vellis-monitord")));
   std::string why;

@@ -152,15 +152,15 @@ int64_t Monitor::Step() {
     unwritten_bytes_ += lines.size();
   }
   if (!unwritten_.empty()) {
-    if (now - written_at_ms_ >= options_.write_every_ms || unwritten_bytes_ >= kWriteBytes) {
+    const bool due =
+        now - written_at_ms_ >= options_.write_every_ms || unwritten_bytes_ >= kWriteBytes;
+    if (due) {
       WriteLines();
       written_at_ms_ = now;
     }
-    if (!unwritten_.empty()) {
-      sooner(unwritten_bytes_ > 0 && now - written_at_ms_ < options_.write_every_ms
-                 ? written_at_ms_ + options_.write_every_ms
-                 : now + 1000);
-    }
+    // Lines left after a write could not be written: tried again in a
+    // second, not at the pace of the batching.
+    if (!unwritten_.empty()) sooner(due ? now + 1000 : written_at_ms_ + options_.write_every_ms);
   }
 
   if (now - rate_at_ms_ >= 1000) {

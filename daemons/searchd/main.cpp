@@ -6,7 +6,6 @@
 // connections are taken, accepted ones are answered, pending writes are
 // committed.
 #include <signal.h>
-#include <sys/signalfd.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -33,15 +32,8 @@ void Log(int priority, const std::string& text) {
 
 int Serve(int workers, int recv_timeout_ms) {
   using namespace vellis::searchd;
-  // Block the stop signals in every thread; they arrive on a descriptor.
-  sigset_t stop;
-  sigemptyset(&stop);
-  sigaddset(&stop, SIGTERM);
-  sigaddset(&stop, SIGINT);
-  pthread_sigmask(SIG_BLOCK, &stop, nullptr);
-  signal(SIGPIPE, SIG_IGN);
-  int stop_fd = signalfd(-1, &stop, SFD_CLOEXEC);
-  if (stop_fd < 0) throw vellis::Error(vellis::kErrInternal, "signalfd failed");
+  // The stop signals arrive on a descriptor, in no thread.
+  const int stop_fd = vellis::daemon::StopSignalDescriptor();
 
   vellis::daemon::RaiseDescriptorLimit();
   vellis::daemon::PidFile pid_file(vellis::RootPath(vellis::daemon::PidFilePath("vellis-searchd")));

@@ -30,7 +30,8 @@ constexpr ServiceMapping kServices[] = {
     {kSearchService, "vellis-searchd.service", "vellis-searchd"},
     {kMonitorService, "vellis-monitord.service", "vellis-monitord"},
     {"qorucontentextractd", "vellis-extractd.service", "vellis-extractd"},
-    {"pkg-Vellis-fileindexd", "vellis-fileindexd.service", "vellis-fileindexd"},
+    // The indexing daemon needs the changes that the monitor reports.
+    {"pkg-Vellis-fileindexd", "vellis-fileindexd.service", "vellis-fileindexd", "vellis-monitord"},
 };
 
 // A stopped daemon gets this long after SIGTERM before SIGKILL.
@@ -261,15 +262,11 @@ int Control(const std::string& service, Action action, bool wait) {
   }
   if (HasSystemd()) return Systemctl(*s, action, wait);
   if (!s->program) return SambaInitScript(action);
-  // The indexing daemon needs the changes that the monitor reports: the
-  // monitor comes and goes with it (under systemd its unit wants it).
-  if (strcmp(s->program, "vellis-fileindexd") == 0 &&
-      access(ServiceProgramPath("vellis-monitord").c_str(), X_OK) == 0) {
-    const int rc =
-        action == Action::kStop ? StopOwn("vellis-monitord", wait) : StartOwn("vellis-monitord");
+  if (s->companion && access(ServiceProgramPath(s->companion).c_str(), X_OK) == 0) {
+    const int rc = action == Action::kStop ? StopOwn(s->companion, wait) : StartOwn(s->companion);
     if (rc != 0) {
-      GetPlatform()->Syslog(LOG_ERR, std::string("Service ") + ActionName(action) +
-                                         " vellis-monitord failed with " + s->service);
+      GetPlatform()->Syslog(LOG_ERR, std::string("Service ") + ActionName(action) + " " +
+                                         s->companion + " failed with " + s->service);
     }
   }
   switch (action) {

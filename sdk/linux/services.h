@@ -38,6 +38,9 @@ struct ServiceMapping {
   const char* service;  // the appliance's name ("pkg-Vellis-fileindexd")
   const char* unit;     // the systemd unit ("vellis-fileindexd.service")
   const char* program;  // our program run without systemd; null for samba
+  // Our program that comes and goes with this one without systemd (where
+  // the unit wants it instead); null for none.
+  const char* companion = nullptr;
 };
 
 // The mapping of `service`; null for a name we do not know.

@@ -5,6 +5,7 @@
 #include <cstdio>
 #include <iostream>
 #include <memory>
+#include <set>
 #include <sstream>
 #include <string>
 #include <thread>
@@ -102,7 +103,8 @@ std::string Text(const Json::Value& v) {
     snprintf(buf, sizeof(buf), "%.0f", v.asDouble());
     return buf;
   }
-  return v.toStyledString().substr(0, v.toStyledString().find('\n'));
+  const std::string styled = v.toStyledString();
+  return styled.substr(0, styled.find('\n'));
 }
 
 void PrintHuman(const Json::Value& st) {
@@ -156,13 +158,9 @@ std::string ProgressLine(const Json::Value& st) {
   long long documents = 0, waiting = 0, crawled = 0;
   double rate = 0, eta = -1;
   bool crawling_unknown = false;
-  std::vector<std::string> seen;
+  std::set<std::string> seen;  // a share's figures count once, however many folders
   for (const Json::Value& f : st["folders"]) {
-    const std::string share = f["share"].asString();
-    bool dup = false;
-    for (const std::string& s : seen) dup = dup || s == share;
-    if (dup) continue;
-    seen.push_back(share);
+    if (!seen.insert(f["share"].asString()).second) continue;
     documents += f["documents"].isIntegral() ? f["documents"].asInt64() : 0;
     waiting += f["events_waiting"].isIntegral() ? f["events_waiting"].asInt64() : 0;
     if (f["state"].asString() == "crawling") {

@@ -3,6 +3,7 @@
 // past the watch limit.
 #include <gtest/gtest.h>
 #include <json/json.h>
+#include <unistd.h>
 
 #include <memory>
 #include <sstream>
@@ -110,6 +111,19 @@ TEST_F(MonitorStepTest, FoldersPastTheWatchLimitAreRescanned) {
   monitor_->Step();
   EXPECT_EQ(Lines(qa_).size(), 3u);
   EXPECT_TRUE(Lines(qb_).empty());
+}
+
+// A queue that cannot be written keeps its lines, tried again each second
+// rather than at the pace of the batching.
+TEST_F(MonitorStepTest, LinesForAQueueThatCannotBeWrittenWaitASecond) {
+  MakeDirs(qa_);  // a folder where the queue file should be
+  fake_->events = {{FsEventKind::kCreate, a_ + "/x.txt", false, 0}};
+  EXPECT_EQ(monitor_->Step(), now_ + 1000);
+  EXPECT_EQ(monitor_->Status()["errors"].size(), 1u);
+  now_ += 1000;
+  ASSERT_EQ(rmdir(qa_.c_str()), 0);
+  EXPECT_EQ(monitor_->Step(), -1) << "written once the queue can be";
+  EXPECT_EQ(Lines(qa_), std::vector<std::string>{"64 " + a_ + "/x.txt"});
 }
 
 }  // namespace
